@@ -1,0 +1,40 @@
+// Reading and writing property lists: XML and binary, detected from the bytes. Strict: every
+// malformed, out-of-range or hostile input is an error that says what is wrong and where.
+#pragma once
+
+#include <cstddef>
+#include <cstdint>
+#include <optional>
+#include <span>
+#include <string>
+
+#include "core/plist/value.h"
+
+namespace appsync::plist {
+
+enum class Format { Xml, Binary };
+
+// Bounds on what the readers accept; nothing recurses or allocates beyond them.
+inline constexpr std::size_t kMaxDepth = 512;                      // nested containers
+inline constexpr std::size_t kMaxInputSize = 256u * 1024u * 1024u;  // bytes of one document
+
+// What went wrong, and where: "binary property list: object 12 at offset 0x4f: ..." or
+// "XML property list, line 3, column 7: ...".
+struct ParseError {
+  std::string message;
+};
+
+// Parses a whole document. Returns the root value, or absent with *error filled (error may be
+// null). *format, when given, receives the format that was detected.
+std::optional<Value> parse(std::span<const std::uint8_t> bytes, ParseError* error = nullptr,
+                           Format* format = nullptr);
+
+// Serialises a value. Fails (absent, *error filled) only for values the format cannot carry:
+// nesting deeper than kMaxDepth, or strings that are not valid UTF-8.
+std::optional<Bytes> writeBinary(const Value& value, std::string* error = nullptr);
+std::optional<std::string> writeXml(const Value& value, std::string* error = nullptr);
+
+// Writes in the given format (XML as its bytes).
+std::optional<Bytes> write(const Value& value, Format format, std::string* error = nullptr);
+
+}  // namespace appsync::plist
