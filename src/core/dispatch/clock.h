@@ -5,8 +5,8 @@
 #include <chrono>
 #include <condition_variable>
 #include <functional>
+#include <list>
 #include <mutex>
-#include <set>
 
 namespace appsync {
 
@@ -50,15 +50,22 @@ class ManualClock final : public Clock {
   std::size_t waiterCount() const;
 
  private:
+  // A thread blocked in waitUntil, identified by the mutex and condition variable it waits on.
+  // advance() notifies waiters without holding mutex_ (a waiter calls now() while holding its
+  // own mutex), so a waiter that is being notified must not leave before the notification is
+  // done: `notifying` counts advances still holding a reference to this record.
   struct Waiter {
     std::mutex* mutex;
     std::condition_variable* cv;
-    bool operator<(const Waiter& o) const { return cv < o.cv; }
+    int notifying = 0;
+    bool leaving = false;
   };
+  void removeWaiter(std::list<Waiter>::iterator waiter, std::unique_lock<std::mutex>& userLock);
+
   mutable std::mutex mutex_;
   mutable std::condition_variable changed_;
   TimePoint now_;
-  std::multiset<Waiter> waiters_;
+  std::list<Waiter> waiters_;  // list: records keep their address while others come and go
 };
 
 }  // namespace appsync

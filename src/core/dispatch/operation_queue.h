@@ -21,6 +21,8 @@ class OperationQueue {
   OperationQueue(const OperationQueue&) = delete;
   OperationQueue& operator=(const OperationQueue&) = delete;
 
+  // Applies to operations that start from now on; running ones are not interrupted. Zero is
+  // taken as one.
   void setMaxConcurrentOperationCount(std::size_t n);
   std::size_t maxConcurrentOperationCount() const;
 
@@ -36,6 +38,8 @@ class OperationQueue {
 
  private:
   void workerLoop();
+  // Starts workers, up to the limit, until there is one for every queued or running operation.
+  void addWorkersLocked();
 
   std::string name_;
   mutable std::mutex mutex_;

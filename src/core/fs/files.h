@@ -19,13 +19,16 @@ namespace appsync {
 std::optional<plist::Bytes> readFile(const std::string& path, ErrorRef* error = nullptr);
 
 // Replaces `path` with `bytes` so that any reader, and any crash of this process, sees either the
-// old file or the new one: a temporary file in the same directory is written completely and
-// flushed, then renamed over the target. On failure the old file is left as it was and the
-// temporary file is removed.
+// old file or the new one: a temporary file in the same directory is written completely, then
+// renamed over the target. It is not synced to the disk; the guarantee covers crashes of the
+// process, not of the machine. The new file keeps the old one's permission bits (0644 for a new
+// file). On failure the old file is left as it was and the temporary file is removed. A process
+// killed in the middle may leave its temporary file (".NAME.XXXXXX") behind.
 bool writeFileAtomically(const std::string& path, std::span<const std::uint8_t> bytes,
                          ErrorRef* error = nullptr);
 
-// Serialises `value` in `format` and writes it atomically.
+// Serialises `value` in `format` and writes it atomically. A value the format cannot carry is
+// an error of kPropertyListErrorDomain with the codec's message and the path.
 bool writePlistAtomically(const std::string& path, const plist::Value& value,
                           plist::Format format, ErrorRef* error = nullptr);
 

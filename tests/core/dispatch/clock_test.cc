@@ -1,0 +1,76 @@
+// The clocks: deadlines under the system clock, and the manual clock's wake-ups and waiter
+// bookkeeping while waiters come and go during advances.
+#include "core/dispatch/clock.h"
+
+#include <gtest/gtest.h>
+
+#include <atomic>
+#include <memory>
+#include <thread>
+#include <vector>
+
+namespace appsync {
+namespace {
+
+using namespace std::chrono_literals;
+
+TEST(SystemClockTest, WaitEndsAtDeadlineOrWhenReady) {
+  SystemClock clock;
+  std::mutex mutex;
+  std::condition_variable cv;
+  std::unique_lock<std::mutex> lock(mutex);
+  TimePoint start = clock.now();
+  EXPECT_FALSE(clock.waitUntil(lock, cv, start + 2ms, [] { return false; }));
+  EXPECT_GE(clock.now(), start + 2ms);
+  EXPECT_TRUE(clock.waitUntil(lock, cv, start + 1h, [] { return true; }));
+}
+
+TEST(ManualClockTest, WaitEndsOnlyWhenAnAdvanceReachesTheDeadline) {
+  ManualClock clock;
+  std::mutex mutex;
+  std::condition_variable cv;
+  std::atomic<int> result{-1};
+  TimePoint deadline = clock.now() + 10s;
+  std::thread waiter([&] {
+    std::unique_lock<std::mutex> lock(mutex);
+    result = clock.waitUntil(lock, cv, deadline, [] { return false; }) ? 1 : 0;
+  });
+  clock.waitForWaiters(1);
+  clock.advance(9s);
+  EXPECT_EQ(clock.waiterCount(), 1u);
+  EXPECT_EQ(result.load(), -1);
+  clock.advance(1s);
+  waiter.join();
+  EXPECT_EQ(result.load(), 0);
+  EXPECT_EQ(clock.waiterCount(), 0u);
+  EXPECT_EQ(clock.now(), TimePoint{} + 10s);
+}
+
+// Waiters whose mutex and condition variable live only as long as their wait, while another
+// thread advances as fast as it can: an advance must never touch a waiter that has gone.
+TEST(ManualClockTest, ShortLivedWaitersSurviveConcurrentAdvances) {
+  ManualClock clock;
+  std::atomic<bool> done{false};
+  std::thread advancer([&] {
+    while (!done) clock.advance(1ms);
+  });
+  std::vector<std::thread> waiters;
+  for (int t = 0; t < 4; ++t) {
+    waiters.emplace_back([&] {
+      for (int i = 0; i < 200; ++i) {
+        auto mutex = std::make_unique<std::mutex>();
+        auto cv = std::make_unique<std::condition_variable>();
+        std::unique_lock<std::mutex> lock(*mutex);
+        EXPECT_FALSE(clock.waitUntil(lock, *cv, clock.now() + 2ms, [] { return false; }));
+        lock.unlock();
+      }
+    });
+  }
+  for (std::thread& w : waiters) w.join();
+  done = true;
+  advancer.join();
+  EXPECT_EQ(clock.waiterCount(), 0u);
+}
+
+}  // namespace
+}  // namespace appsync

@@ -1,0 +1,18 @@
+// appsync-host: plays the host daemon and the host computer against a device kept in a
+// directory, and offers tools for the files of the field.
+#include <CLI/CLI.hpp>
+
+#include "commands.h"
+
+int main(int argc, char** argv) {
+  CLI::App app{"appsync-host: drive the application-sync plugin against a simulated device"};
+  app.require_subcommand(1);
+  int status = 0;
+  appsync::host::addPlistCommands(app, status);
+  try {
+    app.parse(argc, argv);
+  } catch (const CLI::ParseError& e) {
+    return app.exit(e);
+  }
+  return status;
+}
