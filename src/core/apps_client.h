@@ -6,6 +6,7 @@
 
 #include <atomic>
 #include <cstdint>
+#include <functional>
 #include <memory>
 #include <mutex>
 #include <optional>
@@ -63,6 +64,8 @@ class AppsClient : public TRClient,
 
   // ---- Accessors used across the client -------------------------------------------------------
   std::uint32_t _getAndResetNumAppInstallsAttempted();
+  // Counts one call of the registry's install operation (relaxed atomic add).
+  void _countAppInstallAttempt() { _numAppInstallsAttempted.fetch_add(1, std::memory_order_relaxed); }
   bool _appInstallationAllowed();
   bool _appRemovalAllowed();
 
@@ -88,6 +91,42 @@ class AppsClient : public TRClient,
                                      const std::string& identifier,
                                      const std::optional<std::string>& version);
   void cleanRestoreStateForIdentifier(const std::string& identifier);
+
+  // ---- Home screen (homescreen/) -------------------------------------------------------------
+  // Tells the home screen that a sync starts (true) or is done (false).
+  static void _notifyPavilion(const Platform& platform, bool starting);
+  // Hands the icon layout of the sync folder to the home screen, unless it is missing or empty.
+  static void _sendIconLayoutToPavilion(const Platform& platform);
+  // Orders candidate records (identifier -> record) by the home screen's icon order; items
+  // placed by that order are removed from `items`, the others follow in identifier order.
+  static plist::Array _orderTheItems(const Platform& platform, plist::Dict& items);
+  // Renders the bundle's home-screen icon to a PNG file at `saveTo`. True when it was written.
+  static bool _makeIconFromBundlePath(const Platform& platform,
+                                      const std::optional<std::string>& bundlePath,
+                                      const std::string& saveTo);
+
+  // ---- Restore placeholders (restore/placeholders*.cc) ----------------------------------------
+  // TEMP/com.vantor.trc.Apps/ID.app; absent for an identifier that would leave that directory.
+  std::optional<std::string> placeholderAppPathForBundleIdentifier(const std::string& bundleID);
+  bool createPlaceHolderPath(const std::string& path, const std::string& forBundleIdentifier,
+                             const FileAttributes& withAttributes);
+  bool writeIconData(const std::optional<plist::Bytes>& iconData, const std::string& atPath,
+                     std::uint64_t* returningFileSize, const std::string& forBundleIdentifier,
+                     const FileAttributes& withAttributes);
+  // The restore road for one application of the restore list.
+  bool _processCaravelRestoreInfoForApp(const std::string& bundleID,
+                                        const plist::Bytes& caravelMetaData,
+                                        const std::optional<plist::Bytes>& sinfData,
+                                        const std::optional<plist::Bytes>& iconData);
+  // The sync road: a placeholder for an asset the host is about to send.
+  void _createPlaceHolderApplication(const std::shared_ptr<TRAsset>& asset);
+
+  // ---- Placeholder lookup (restore/placeholder_lookup.cc) -------------------------------------
+  using ProxyBlock =
+      std::function<void(const std::shared_ptr<const ARApplicationProxy>& proxy, bool* stop)>;
+  bool _placeholderExistsForApplication(const std::string& bundleID);
+  void _enumeratePlaceholdersWithBlock(const ProxyBlock& block);
+  std::set<std::string> _getSystemAppPlaceholders();
 
   // ---- Facts for tests and the simulator -----------------------------------------------------
   bool useInstallCoordinator() const { return _useInstallCoordinator; }

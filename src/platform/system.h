@@ -3,6 +3,7 @@
 #pragma once
 
 #include <cstdint>
+#include <optional>
 #include <string>
 
 #include "core/dispatch/clock.h"
@@ -10,6 +11,12 @@
 #include "core/plist/value.h"
 
 namespace appsync {
+
+// Owner and group given to files and directories the plugin creates ("mobile" on a device).
+struct FileAttributes {
+  std::optional<std::string> ownerAccountName;
+  std::optional<std::string> groupOwnerAccountName;
+};
 
 // Callback of the system-wide notification center (center, observer, name, object, info).
 using NotificationCallback = void (*)(void* center, void* observer, const std::string& name,

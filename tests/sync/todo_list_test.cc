@@ -4,13 +4,15 @@
 
 #include <gtest/gtest.h>
 
+#include <map>
+#include <sstream>
 #include <thread>
 #include <vector>
 
 #include "core/apps_client.h"
 #include "core/fs/files.h"
 #include "core/plist/codec.h"
-#include "platform/fake/fake_tr_host.h"
+#include "platform/fake/fake_tr.h"
 #include "support/temp_dir.h"
 
 namespace appsync {
@@ -161,35 +163,47 @@ TEST_F(TodoListTest, LoadersAcceptBothFormatsAndReportWrongRoots) {
 }
 
 TEST_F(TodoListTest, ConcurrentChangesAreAllKept) {
-  constexpr int kThreads = 10, kPerThread = 1000;
+  // 10 threads make 1,000 changes each: every thread walks its own 100 records ten times. A
+  // lost update would show as a final state that is not the last round, or as a logged change
+  // whose "from" is not the state the previous change of that record wrote.
+  constexpr int kThreads = 10, kRecords = 100, kRounds = 10;
+  auto id = [](int t, int i) { return "com.t" + std::to_string(t) + ".app" + std::to_string(i); };
   plist::Array list;
   for (int t = 0; t < kThreads; ++t) {
-    for (int i = 0; i < kPerThread; ++i) {
-      list.emplace_back(record("com.t" + std::to_string(t) + ".app" + std::to_string(i), "install"));
-    }
+    for (int i = 0; i < kRecords; ++i) list.emplace_back(record(id(t, i), "install"));
   }
   write(list, plist::Format::Binary);
   std::vector<std::thread> threads;
   for (int t = 0; t < kThreads; ++t) {
     threads.emplace_back([&, t] {
-      for (int i = 0; i < kPerThread; ++i) {
-        todo.changeAssetID("com.t" + std::to_string(t) + ".app" + std::to_string(i),
-                           "INSTALLED-" + std::to_string(t));
+      for (int round = 0; round < kRounds; ++round) {
+        for (int i = 0; i < kRecords; ++i) todo.changeAssetID(id(t, i), "R" + std::to_string(round));
       }
     });
   }
   for (auto& th : threads) th.join();
+
   plist::Array after = load();
   ASSERT_EQ(after.size(), list.size());
-  for (int t = 0; t < kThreads; ++t) {
-    for (int i = 0; i < kPerThread; ++i) {
-      const plist::Dict* r = after[t * kPerThread + i].dict();
-      ASSERT_NE(r, nullptr);
-      ASSERT_EQ(*plist::stringAt(*r, "operation"), "INSTALLED-" + std::to_string(t));
-    }
+  for (const plist::Value& r : after) {
+    ASSERT_EQ(*plist::stringAt(*r.dict(), "operation"), "R" + std::to_string(kRounds - 1));
   }
+  std::map<std::string, std::string> last;
+  std::size_t changes = 0;
+  const std::string prefix = "com.vantor.trc.AppSync|Changing ";
+  for (const std::string& m : messages()) {
+    ASSERT_EQ(m.rfind(prefix, 0), 0u) << m;
+    std::istringstream words(m.substr(prefix.size()));
+    std::string who, from, fromValue, to, toValue;
+    words >> who >> from >> fromValue >> to >> toValue;
+    auto [it, fresh] = last.try_emplace(who, "install");
+    ASSERT_EQ(fromValue, it->second) << m;
+    it->second = toValue;
+    ++changes;
+  }
+  EXPECT_EQ(changes, static_cast<std::size_t>(kThreads * kRecords * kRounds));
   // Writers that arrived during a rewrite shared the next one.
-  EXPECT_LT(todo.rewriteCount(), static_cast<std::uint64_t>(kThreads * kPerThread));
+  EXPECT_LT(todo.rewriteCount(), changes);
 }
 
 }  // namespace

@@ -104,7 +104,7 @@ TEST_F(RestoreStateStoreTest, EntriesOfAnotherShapeAreLeftAlone) {
 }
 
 TEST_F(RestoreStateStoreTest, ConcurrentWritersAndCleanersLoseNothing) {
-  constexpr int kThreads = 10, kPerThread = 40;
+  constexpr int kThreads = 10, kPerThread = 20;
   std::vector<std::thread> threads;
   for (int t = 0; t < kThreads; ++t) {
     threads.emplace_back([&, t] {

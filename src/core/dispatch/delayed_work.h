@@ -45,9 +45,9 @@ class DelayedWorkQueue {
   std::string name_;
   Clock& clock_;
   mutable std::mutex mutex_;
-  std::condition_variable cv_;         // the timer: an item was added, or stopping
-  std::condition_variable dueReady_;   // the runners: an item is due, or stopping
-  std::condition_variable idle_;       // waitUntilIdle
+  std::condition_variable cv_;        // the timer: an item was added, or stopping
+  std::condition_variable dueReady_;  // the runners: an item is due, or stopping
+  std::condition_variable idle_;      // waitUntilIdle
   std::multimap<TimePoint, std::function<void()>> pending_;
   std::deque<std::function<void()>> due_;
   std::vector<std::thread> runners_;

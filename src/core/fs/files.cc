@@ -163,8 +163,8 @@ bool writeFileAtomically(const std::string& path, std::span<const std::uint8_t> 
   return true;
 }
 
-bool writePlistAtomically(const std::string& path, const plist::Value& value,
-                          plist::Format format, ErrorRef* error) {
+bool writePlistAtomically(const std::string& path, const plist::Value& value, plist::Format format,
+                          ErrorRef* error) {
   std::string message;
   std::optional<plist::Bytes> bytes = plist::write(value, format, &message);
   if (!bytes) {

@@ -29,8 +29,8 @@ bool writeFileAtomically(const std::string& path, std::span<const std::uint8_t> 
 
 // Serialises `value` in `format` and writes it atomically. A value the format cannot carry is
 // an error of kPropertyListErrorDomain with the codec's message and the path.
-bool writePlistAtomically(const std::string& path, const plist::Value& value,
-                          plist::Format format, ErrorRef* error = nullptr);
+bool writePlistAtomically(const std::string& path, const plist::Value& value, plist::Format format,
+                          ErrorRef* error = nullptr);
 
 bool fileExists(const std::string& path);
 bool directoryExists(const std::string& path);

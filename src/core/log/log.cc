@@ -6,9 +6,7 @@
 
 namespace appsync {
 
-const char* logLevelName(LogLevel level) {
-  return level == LogLevel::Error ? "Error" : "Default";
-}
+const char* logLevelName(LogLevel level) { return level == LogLevel::Error ? "Error" : "Default"; }
 
 // ---- LogArg --------------------------------------------------------------------------------
 
@@ -151,13 +149,20 @@ std::size_t matchSpecifier(std::string_view rest, Conversion* conversion) {
   };
   // Longer spellings first, so that "ld" is not taken for a "l" prefix of something else.
   static constexpr Spec kSpecs[] = {
-      {"{private}@", Conversion::Private}, {"{public}@", Conversion::Object},
-      {"lld", Conversion::Integer},        {"llu", Conversion::Integer},
-      {"ld", Conversion::Integer},         {"lu", Conversion::Integer},
-      {"zu", Conversion::Integer},         {"lf", Conversion::Real},
-      {"s", Conversion::Object},           {"@", Conversion::Object},
-      {"d", Conversion::Integer},          {"i", Conversion::Integer},
-      {"u", Conversion::Integer},          {"f", Conversion::Real},
+      {"{private}@", Conversion::Private},
+      {"{public}@", Conversion::Object},
+      {"lld", Conversion::Integer},
+      {"llu", Conversion::Integer},
+      {"ld", Conversion::Integer},
+      {"lu", Conversion::Integer},
+      {"zu", Conversion::Integer},
+      {"lf", Conversion::Real},
+      {"s", Conversion::Object},
+      {"@", Conversion::Object},
+      {"d", Conversion::Integer},
+      {"i", Conversion::Integer},
+      {"u", Conversion::Integer},
+      {"f", Conversion::Real},
       {"c", Conversion::Char},
   };
   for (const Spec& spec : kSpecs) {

@@ -94,9 +94,10 @@ class LogArg {
   std::string text_;
 };
 
-// Formats a message with the specifiers the plugin uses: %s %d %u %ld %lu %lld %llu %f %lf %c
-// %@ %{public}@ %%. An argument of another kind than its specifier asks for is printed as best
-// it can be (never undefined behaviour); a missing or absent argument prints "(null)".
+// Formats a message with the specifiers the plugin uses: %s %d %i %u %ld %lu %lld %llu %zu %f
+// %lf %c %@ %{public}@ %{private}@ (printed as "<private>") %%. An argument of another kind than
+// its specifier asks for is printed as best it can be (never undefined behaviour); a missing or
+// absent argument prints "(null)". Any other specifier is copied as it is and takes no argument.
 std::string formatLogMessage(std::string_view format, std::span<const LogArg> args);
 
 // The log object of one category.

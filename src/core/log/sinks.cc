@@ -1,10 +1,10 @@
 // The log sinks: in memory for tests, and one line per message in a file.
-#include "core/log/log.h"
-
 #include <algorithm>
 #include <chrono>
 #include <cstdio>
 #include <ctime>
+
+#include "core/log/log.h"
 
 namespace appsync {
 

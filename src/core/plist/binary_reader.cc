@@ -59,6 +59,11 @@ const char* markerKind(std::uint8_t marker) {
   }
 }
 
+std::string withArticle(std::string_view noun) {
+  bool vowel = !noun.empty() && std::string_view("aeiou").find(noun[0]) != std::string_view::npos;
+  return (vowel ? "an " : "a ") + std::string(noun);
+}
+
 class BinaryReader {
  public:
   explicit BinaryReader(std::span<const std::uint8_t> bytes)
@@ -377,8 +382,8 @@ bool BinaryReader::readKey(const Frame& frame, std::uint64_t object, std::string
   if (!offsetOf(object, &offset) || !readHeader(object, offset, &h)) return false;
   if ((h.marker >> 4) != 0x5 && (h.marker >> 4) != 0x6) {
     return failObject(frame.object, frame.offset,
-                      "dictionary key (object " + std::to_string(object) + ") is a " +
-                          markerKind(h.marker) + ", not a string");
+                      "dictionary key (object " + std::to_string(object) + ") is " +
+                          withArticle(markerKind(h.marker)) + ", not a string");
   }
   if (!readString(object, offset, h, key)) return false;
   if (frame.dict.contains(*key)) {
@@ -438,10 +443,10 @@ std::optional<Value> BinaryReader::run(ParseError* error) {
   while (!stack_.empty()) {
     Frame& frame = stack_.back();
     if (frame.next == frame.count) {
-      Frame done = std::move(frame);
+      inProgress_[frame.object] = false;
+      Value done = frame.isDict ? Value(std::move(frame.dict)) : Value(std::move(frame.array));
       stack_.pop_back();
-      inProgress_[done.object] = false;
-      deliver(done.isDict ? Value(std::move(done.dict)) : Value(std::move(done.array)));
+      deliver(std::move(done));
       continue;
     }
     const std::uint64_t i = frame.next++;

@@ -23,16 +23,24 @@ Dict::Dict() = default;
 Dict::Dict(std::initializer_list<std::pair<std::string, Value>> entries) {
   for (const auto& [key, value] : entries) set(key, value);
 }
-Dict::Dict(const Dict&) = default;
+Dict::Dict(const Dict& other)
+    : entries_(other.entries_),
+      index_(other.index_ ? std::make_unique<Index>(*other.index_) : nullptr) {}
 Dict::Dict(Dict&&) noexcept = default;
-Dict& Dict::operator=(const Dict&) = default;
+Dict& Dict::operator=(const Dict& other) {
+  if (this != &other) {
+    entries_ = other.entries_;
+    index_ = other.index_ ? std::make_unique<Index>(*other.index_) : nullptr;
+  }
+  return *this;
+}
 Dict& Dict::operator=(Dict&&) noexcept = default;
 Dict::~Dict() = default;
 
 std::optional<std::size_t> Dict::indexOf(std::string_view key) const {
-  if (!index_.empty()) {
-    auto it = index_.find(key);
-    if (it == index_.end()) return std::nullopt;
+  if (index_) {
+    auto it = index_->find(key);
+    if (it == index_->end()) return std::nullopt;
     return it->second;
   }
   for (std::size_t i = 0; i < entries_.size(); ++i) {
@@ -61,9 +69,9 @@ void Dict::set(std::string key, Value value) {
 
 bool Dict::insertNew(std::string key, Value value) {
   if (indexOf(key)) return false;
-  if (!index_.empty()) index_.emplace(key, entries_.size());
+  if (index_) index_->emplace(key, entries_.size());
   entries_.push_back(Entry{std::move(key), std::move(value)});
-  if (index_.empty() && entries_.size() > kIndexThreshold) rebuildIndex();
+  if (!index_ && entries_.size() > kIndexThreshold) rebuildIndex();
   return true;
 }
 
@@ -77,14 +85,15 @@ bool Dict::erase(std::string_view key) {
 
 void Dict::clear() {
   entries_.clear();
-  index_.clear();
+  index_.reset();
 }
 
 void Dict::rebuildIndex() {
-  index_.clear();
+  index_.reset();
   if (entries_.size() <= kIndexThreshold) return;
-  index_.reserve(entries_.size());
-  for (std::size_t i = 0; i < entries_.size(); ++i) index_.emplace(entries_[i].key, i);
+  index_ = std::make_unique<Index>();
+  index_->reserve(entries_.size());
+  for (std::size_t i = 0; i < entries_.size(); ++i) index_->emplace(entries_[i].key, i);
 }
 
 std::size_t Dict::size() const { return entries_.size(); }
@@ -224,7 +233,10 @@ void describeInto(const Value& v, std::string& out) {
     case Type::Data: {
       static const char* kHex = "0123456789abcdef";
       const Bytes& b = *v.data();
-      out += "<" + std::to_string(b.size()) + " bytes";
+      // Appended piece by piece: g++ 12 at -O3 misreports "<" + std::string as overlapping.
+      out += '<';
+      out += std::to_string(b.size());
+      out += " bytes";
       if (!b.empty()) out += ": ";
       std::size_t shown = std::min<std::size_t>(b.size(), 24);
       for (std::size_t i = 0; i < shown; ++i) {

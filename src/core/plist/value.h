@@ -4,6 +4,7 @@
 #include <concepts>
 #include <cstddef>
 #include <cstdint>
+#include <memory>
 #include <optional>
 #include <string>
 #include <string_view>
@@ -92,8 +93,10 @@ class Dict {
     using is_transparent = void;
     std::size_t operator()(std::string_view s) const { return std::hash<std::string_view>{}(s); }
   };
-  // Only maintained once the dictionary is larger than kIndexThreshold.
-  std::unordered_map<std::string, std::size_t, KeyHash, std::equal_to<>> index_;
+  using Index = std::unordered_map<std::string, std::size_t, KeyHash, std::equal_to<>>;
+  // Only built once the dictionary is larger than kIndexThreshold, and kept behind a pointer so
+  // that the many small dictionaries stay small and cheap to move.
+  std::unique_ptr<Index> index_;
   static constexpr std::size_t kIndexThreshold = 16;
 };
 

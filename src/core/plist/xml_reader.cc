@@ -216,13 +216,14 @@ void XmlReader::start(const char* rawName) {
   std::optional<Element> element = elementNamed(name);
   if (!element) return fail("unknown element <" + std::string(name) + ">");
 
+  // (A second root element never gets here: expat refuses it as junk after the document.)
   if (stack_.empty()) {
-    if (root_) return fail("more than one root element");
     if (*element == Element::Key) return fail("<key> outside a <dict>");
   } else {
     Container& parent = stack_.back();
-    if (*element == Element::Plist)
+    if (*element == Element::Plist) {
       return fail("<plist> inside <" + std::string(nameOf(parent.element)) + ">");
+    }
     switch (parent.element) {
       case Element::Plist:
         if (*element == Element::Key) return fail("<key> outside a <dict>");
@@ -298,7 +299,6 @@ void XmlReader::end() {
 
 void XmlReader::finishLeaf() {
   inLeaf_ = false;
-  const std::string what = nameOf(leaf_);
   switch (leaf_) {
     case Element::Key: {
       Container& parent = stack_.back();

@@ -1,5 +1,5 @@
 // Coverage of the continuous-corner outline, computed once per icon size: exact along each
-// pixel row, 16 sub-rows per pixel.
+// pixel row, 16 sub-rows per pixel, averaged with the same by columns.
 #include "platform/icon/corner_mask.h"
 
 #include <algorithm>
@@ -27,7 +27,7 @@ ContinuousCornerMask::ContinuousCornerMask(int size)
   const double extent = std::min(kCornerExtent * kCornerRadius * side, side / 2);
   std::vector<double> inset(kSubRows);
   for (int y = 0; y < size_; ++y) {
-    bool touchesCorner = false;
+    double deepest = 0;
     for (int s = 0; s < kSubRows; ++s) {
       const double centre = y + (s + 0.5) / kSubRows;
       const double fromEdge = std::min(centre, side - centre);
@@ -38,11 +38,14 @@ ContinuousCornerMask::ContinuousCornerMask(int size)
       // The outline at this height: how far in from the left (and right) edge it lies.
       const double v = (extent - fromEdge) / extent;
       inset[s] = extent - extent * std::pow(1.0 - std::pow(v, n), 1.0 / n);
-      touchesCorner = true;
+      deepest = std::max(deepest, inset[s]);
     }
-    if (!touchesCorner) continue;
+    // Only the pixels at the two ends of the row can be cut.
+    const int cut = static_cast<int>(std::ceil(deepest));
+    if (cut == 0) continue;
     float* row = coverage_.data() + std::size_t(y) * size_;
     for (int x = 0; x < size_; ++x) {
+      if (x == cut && size_ - cut > x) x = size_ - cut;
       double covered = 0;
       for (int s = 0; s < kSubRows; ++s) {
         const double lo = std::max(double(x), inset[s]);
@@ -50,6 +53,15 @@ ContinuousCornerMask::ContinuousCornerMask(int size)
         covered += std::clamp(hi - lo, 0.0, 1.0);
       }
       row[x] = static_cast<float>(covered / kSubRows);
+    }
+  }
+  // The outline is symmetric about the diagonal but sampling by rows is not; averaging the two
+  // directions halves the sampling error and makes the corners exact mirror images.
+  for (int y = 0; y < size_; ++y) {
+    for (int x = 0; x < y; ++x) {
+      float& a = coverage_[std::size_t(y) * size_ + x];
+      float& b = coverage_[std::size_t(x) * size_ + y];
+      a = b = (a + b) / 2;
     }
   }
 }

@@ -55,7 +55,8 @@ std::shared_ptr<QIImage> HomeScreenIconService::renderIcon(const QIBundle& bundl
   return std::make_shared<QIImage>(std::move(icon));
 }
 
-std::shared_ptr<QIImage> HomeScreenIconService::QICreateDeviceAppropriateHomeScreenIconImageFromBundle(
+std::shared_ptr<QIImage>
+HomeScreenIconService::QICreateDeviceAppropriateHomeScreenIconImageFromBundle(
     const QIBundle& bundle) {
   return renderIcon(bundle, nullptr);
 }

@@ -46,6 +46,18 @@ bool isSafeName(const std::string& name) {
          name.find_first_of(std::string_view("/\0", 2)) == std::string::npos;
 }
 
+// True when `path` is a regular file that, with symbolic links resolved, lies inside
+// `bundleDir`: a link in a bundle must not make the renderer read files elsewhere.
+bool isBundleFile(const std::filesystem::path& bundleDir, const std::filesystem::path& path) {
+  std::error_code ec;
+  if (!std::filesystem::is_regular_file(path, ec)) return false;
+  const std::filesystem::path base = std::filesystem::canonical(bundleDir, ec);
+  if (ec) return false;
+  const std::filesystem::path target = std::filesystem::canonical(path, ec);
+  if (ec) return false;
+  return std::mismatch(base.begin(), base.end(), target.begin(), target.end()).first == base.end();
+}
+
 bool readWholeFile(const std::string& path, std::size_t limit, std::vector<std::uint8_t>* out,
                    std::string* why) {
   std::error_code ec;
@@ -158,16 +170,14 @@ std::vector<std::vector<std::string>> iconNameTiers(const plist::Dict& info, Dev
   return tiers;
 }
 
-std::vector<std::string> iconFileCandidates(const std::string& bundleDir,
-                                            const std::string& name) {
+std::vector<std::string> iconFileCandidates(const std::string& bundleDir, const std::string& name) {
   std::vector<std::string> files;
   if (!isSafeName(name)) return files;
   std::string base = name;
   if (base.size() > 4 && base.ends_with(".png")) base.resize(base.size() - 4);
   for (const char* suffix : kVariantSuffixes) {
     const std::filesystem::path path = std::filesystem::path(bundleDir) / (base + suffix + ".png");
-    std::error_code ec;
-    if (std::filesystem::is_regular_file(path, ec)) files.push_back(path.string());
+    if (isBundleFile(bundleDir, path)) files.push_back(path.string());
   }
   return files;
 }
@@ -180,10 +190,7 @@ std::optional<BundleIcon> findBundleIcon(const std::string& bundleDir, int targe
     return std::nullopt;
   };
   const std::string infoPath = (std::filesystem::path(bundleDir) / "Info.plist").string();
-  std::error_code ec;
-  if (!std::filesystem::is_regular_file(infoPath, ec)) {
-    return failWith("no Info.plist in " + bundleDir);
-  }
+  if (!isBundleFile(bundleDir, infoPath)) return failWith("no Info.plist in " + bundleDir);
   std::vector<std::uint8_t> infoBytes;
   if (!readWholeFile(infoPath, plist::kMaxInputSize, &infoBytes, &problem)) {
     return failWith(problem);
@@ -199,8 +206,8 @@ std::optional<BundleIcon> findBundleIcon(const std::string& bundleDir, int targe
   std::vector<std::string> problems;
   bool anyFile = false;
   for (const std::vector<std::string>& names : tiers) {
-    std::optional<BundleIcon> icon = chooseFromTier(bundleDir, names, targetSize, problems,
-                                                    &anyFile);
+    std::optional<BundleIcon> icon =
+        chooseFromTier(bundleDir, names, targetSize, problems, &anyFile);
     if (icon) return icon;
   }
   if (!anyFile) {

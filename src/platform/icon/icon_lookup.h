@@ -26,9 +26,10 @@ inline constexpr std::size_t kMaxIconFileBytes = 64u * 1024u * 1024u;
 std::vector<std::vector<std::string>> iconNameTiers(const plist::Dict& info, DeviceIdiom idiom);
 
 // The files in `bundleDir` that may hold the icon `name`: NAME.png, NAME@2x.png, NAME@3x.png,
-// NAME~tablet.png, NAME@2x~tablet.png and NAME@3x~tablet.png that exist as regular files, in
-// that order. A trailing ".png" on the name is dropped first. Names that could reach outside the
-// bundle (a "/", ".", "..", empty) have no files.
+// NAME~tablet.png, NAME@2x~tablet.png and NAME@3x~tablet.png that exist as regular files inside
+// the bundle (symbolic links leading out of it do not count), in that order. A trailing ".png"
+// on the name is dropped first. Names that could reach outside the bundle (a "/", ".", "..",
+// empty) have no files.
 std::vector<std::string> iconFileCandidates(const std::string& bundleDir, const std::string& name);
 
 struct BundleIcon {

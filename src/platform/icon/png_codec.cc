@@ -19,8 +19,9 @@ constexpr std::size_t kChunkOverhead = 12;
 // Deflate cannot expand one compressed byte into more than 1032 bytes; a little margin on top.
 constexpr std::uint64_t kMaxInflateRatio = 1040;
 constexpr std::uint64_t kInflateSlack = 1024;
-// The only chunks the decoder needs are small (PLTE, tRNS); nothing else is kept in memory.
-constexpr png_alloc_size_t kMaxChunkAllocation = 1u << 20;
+// Bound on any one ancillary chunk. The decoder keeps only PLTE and tRNS (under 1 KB) and skips
+// the rest, so this only refuses absurd files.
+constexpr png_alloc_size_t kMaxChunkAllocation = 8u << 20;
 
 bool fail(std::string* why, std::string message) {
   if (why) *why = std::move(message);
@@ -45,12 +46,18 @@ bool isChunkTypeByte(std::uint8_t c) { return (c >= 'A' && c <= 'Z') || (c >= 'a
 
 int channelsOf(int colorType) {
   switch (colorType) {
-    case PNG_COLOR_TYPE_GRAY: return 1;
-    case PNG_COLOR_TYPE_GRAY_ALPHA: return 2;
-    case PNG_COLOR_TYPE_RGB: return 3;
-    case PNG_COLOR_TYPE_RGB_ALPHA: return 4;
-    case PNG_COLOR_TYPE_PALETTE: return 1;
-    default: return 0;
+    case PNG_COLOR_TYPE_GRAY:
+      return 1;
+    case PNG_COLOR_TYPE_GRAY_ALPHA:
+      return 2;
+    case PNG_COLOR_TYPE_RGB:
+      return 3;
+    case PNG_COLOR_TYPE_RGB_ALPHA:
+      return 4;
+    case PNG_COLOR_TYPE_PALETTE:
+      return 1;
+    default:
+      return 0;
   }
 }
 
@@ -58,11 +65,14 @@ bool validDepthForType(int colorType, int depth) {
   switch (colorType) {
     case PNG_COLOR_TYPE_GRAY:
       return depth == 1 || depth == 2 || depth == 4 || depth == 8 || depth == 16;
-    case PNG_COLOR_TYPE_PALETTE: return depth == 1 || depth == 2 || depth == 4 || depth == 8;
+    case PNG_COLOR_TYPE_PALETTE:
+      return depth == 1 || depth == 2 || depth == 4 || depth == 8;
     case PNG_COLOR_TYPE_GRAY_ALPHA:
     case PNG_COLOR_TYPE_RGB:
-    case PNG_COLOR_TYPE_RGB_ALPHA: return depth == 8 || depth == 16;
-    default: return false;
+    case PNG_COLOR_TYPE_RGB_ALPHA:
+      return depth == 8 || depth == 16;
+    default:
+      return false;
   }
 }
 
@@ -84,8 +94,8 @@ bool checkChunkFraming(std::span<const std::uint8_t> bytes, const PngHeader& hea
     const std::uint8_t* type = chunk + 4;
     for (int i = 0; i < 4; ++i) {
       if (!isChunkTypeByte(type[i])) {
-        return fail(why, "invalid PNG: chunk at offset " + std::to_string(offset) +
-                             " has an invalid type");
+        return fail(
+            why, "invalid PNG: chunk at offset " + std::to_string(offset) + " has an invalid type");
       }
     }
     if (length > 0x7fffffffu) {
@@ -244,6 +254,9 @@ bool writeRgba(png_structp png, png_infop info, const Image* image, png_bytepp r
   png_set_IHDR(png, info, static_cast<png_uint_32>(image->width),
                static_cast<png_uint_32>(image->height), 8, PNG_COLOR_TYPE_RGB_ALPHA,
                PNG_INTERLACE_NONE, PNG_COMPRESSION_TYPE_DEFAULT, PNG_FILTER_TYPE_DEFAULT);
+  // Icons are small: a quicker deflate level halves the encoding time for files about a tenth
+  // larger than the default level makes.
+  png_set_compression_level(png, 3);
   png_write_info(png, info);
   png_write_image(png, rows);
   png_write_end(png, nullptr);

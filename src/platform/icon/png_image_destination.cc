@@ -7,8 +7,7 @@
 
 namespace appsync::icon {
 
-PngImageDestination::PngImageDestination(std::size_t capacity,
-                                         std::function<bool()> injectFailure)
+PngImageDestination::PngImageDestination(std::size_t capacity, std::function<bool()> injectFailure)
     : capacity_(capacity), injectFailure_(std::move(injectFailure)) {}
 
 void PngImageDestination::addImage(const QIImage& image) {

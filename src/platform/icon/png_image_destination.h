@@ -16,8 +16,7 @@ class PngImageDestination final : public QIImageDestination {
   // `capacity` is the number of images the caller announced; a PNG file holds one, so finalize
   // succeeds only when exactly one image was added and capacity allows it. `injectFailure`,
   // when set, is asked at finalize whether to fail as an encoder error would.
-  explicit PngImageDestination(std::size_t capacity,
-                               std::function<bool()> injectFailure = nullptr);
+  explicit PngImageDestination(std::size_t capacity, std::function<bool()> injectFailure = nullptr);
 
   void addImage(const QIImage& image) override;
   bool finalize() override;

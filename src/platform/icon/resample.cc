@@ -51,8 +51,7 @@ AxisTaps computeTaps(int srcSize, double start, double length, int outSize) {
       }
     } else {
       // Interpolation between the two source pixel centres around the output pixel centre.
-      const double centre =
-          std::clamp(start + (i + 0.5) * scale - 0.5, 0.0, double(srcSize - 1));
+      const double centre = std::clamp(start + (i + 0.5) * scale - 0.5, 0.0, double(srcSize - 1));
       const int j = static_cast<int>(std::floor(centre));
       const double fraction = centre - j;
       if (fraction > 0 && j + 1 < srcSize) {

@@ -5,7 +5,6 @@
 
 #include <algorithm>
 #include <atomic>
-#include <condition_variable>
 #include <mutex>
 #include <string>
 #include <thread>
@@ -60,28 +59,6 @@ TEST(DelayedWorkQueueTest, AnEarlierItemAddedLaterRunsFirst) {
     EXPECT_EQ(ran, (std::vector<std::string>{"five seconds", "now"}));
   }
   EXPECT_EQ(queue.pendingCount(), 1u);
-}
-
-// Two items due together wait for each other: they only finish if they run at the same time.
-TEST(DelayedWorkQueueTest, ItemsDueTogetherRunConcurrently) {
-  ManualClock clock;
-  DelayedWorkQueue queue("concurrent", clock);
-  std::mutex mutex;
-  std::condition_variable cv;
-  int arrived = 0;
-  auto meet = [&] {
-    std::unique_lock<std::mutex> lock(mutex);
-    ++arrived;
-    cv.notify_all();
-    cv.wait(lock, [&] { return arrived == 2; });
-  };
-  queue.after(1s, meet);
-  queue.after(1s, meet);
-  clock.waitForWaiters(1);
-  clock.advance(1s);
-  queue.waitUntilIdle();
-  std::lock_guard<std::mutex> guard(mutex);
-  EXPECT_EQ(arrived, 2);
 }
 
 // Under the system clock: a destructor that waited for the hour would hang the test.

@@ -26,9 +26,8 @@ TEST(SerialQueueTest, ItemsRunOneAtATimeAndDifferentQueuesNest) {
   EXPECT_FALSE(outer.isCurrent());
   outer.sync([&] {
     seen.push_back(outer.isCurrent() ? "in outer" : "not in outer");
-    inner.sync([&] {
-      seen.push_back(outer.isCurrent() && inner.isCurrent() ? "in both" : "lost outer");
-    });
+    inner.sync(
+        [&] { seen.push_back(outer.isCurrent() && inner.isCurrent() ? "in both" : "lost outer"); });
     seen.push_back(inner.isCurrent() ? "still in inner" : "left inner");
   });
   EXPECT_EQ(seen, (std::vector<std::string>{"in outer", "in both", "left inner"}));

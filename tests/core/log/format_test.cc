@@ -45,7 +45,9 @@ TEST(FormatLogMessageTest, EverySpecifier) {
       {"%{public}@pending", {std::string("[]")}, "[]pending"},
       {"100%% done", {}, "100% done"},
       // Absent values of every kind print "(null)", as do arguments that were never passed.
-      {"%@ %{public}@ %d %f", {LogArg(), noString, noThing, nullptr}, "(null) (null) (null) (null)"},
+      {"%@ %{public}@ %d %f",
+       {LogArg(), noString, noThing, nullptr},
+       "(null) (null) (null) (null)"},
       {"%s and %d and %@", {std::string("one")}, "one and (null) and (null)"},
       // A mismatch prints the argument as what it is.
       {"%d", {std::string("text")}, "text"},

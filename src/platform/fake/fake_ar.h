@@ -1,0 +1,201 @@
+// The fake application registry: a workspace that really holds applications and placeholders,
+// installs placeholder and delivered packages under the device root, and tells its observers.
+#pragma once
+
+#include <cstddef>
+#include <cstdint>
+#include <filesystem>
+#include <functional>
+#include <map>
+#include <memory>
+#include <mutex>
+#include <optional>
+#include <string>
+#include <utility>
+#include <vector>
+
+#include "platform/ar.h"
+#include "platform/fake/callback_thread.h"
+#include "platform/fake/fake_service.h"
+
+namespace appsync {
+
+// Operations and how a scripted failure shows:
+//   "applicationIsInstalled:"                     answers false
+//   "uninstallApplication:withOptions:"           false, nothing removed
+//   "installApplication:withOptions:"             false (placeholder install), nothing recorded
+//   "installApplication:withOptions:error:"       false and the error (package install)
+//   "enumerateBundlesOfType:block:"               the block is never called
+//   "installProgressForApplication:withPhase:"    null
+//   "applicationProxyForIdentifier:placeholder:"  null
+//   "addObserver:", "removeObserver:", "installPhaseFinishedForProgress:"  cannot fail
+//
+// Rules of this registry:
+// - Records are kept in insertion order; replacing a record keeps its place. Enumeration and
+//   every list below follow that order.
+// - Bundle kinds: 0 every record (non-application bundles too), 1 every application, 7 system
+//   applications. Other kinds hold nothing.
+// - applicationProxyForIdentifier(id, true) finds any application, placeholder or not;
+//   (id, false) finds it only when it is not a placeholder. Non-application bundles are never
+//   found.
+// - A placeholder install over an installed application turns the record into a placeholder
+//   (keeping its container) until a package install replaces it.
+// - A package is copied into ROOT/private/var/containers/Bundle/Application/ID/NAME.app, which
+//   replaces any earlier bundle in that container and keeps the container's other files (the
+//   store metadata). Uninstalling removes the container.
+// - Install options carrying store metadata (ARCaravelMetadataKey, bytes of a property list)
+//   are written to the container as "CaravelMetadata.plist", as the registry keeps them; a
+//   placeholder install with metadata gets a container for it.
+// - A proxy's installProgressSync is the progress object most recently handed out for the
+//   application (installProgressForApplication or installProgress below) until a package
+//   install completes it, or the application is removed.
+// - Events are delivered on the registry's callback thread; removeObserver returns when no
+//   callback for that observer runs or will run. Called from within a callback it does not wait
+//   (the current callback is the caller's own).
+class FakeARWorkspace final : public ARApplicationWorkspace, public FakeService {
+ public:
+  // Every member has a default, so tests can name only what matters ({.identifier = "a"}).
+  struct AppRecord {
+    std::string identifier{};
+    std::string applicationType = "User";  // "User" or "System"
+    std::optional<std::string> version{};
+    std::optional<std::string> name{};
+    std::uint64_t installType = 0;                 // ARInstallType*
+    bool isPlaceholder = false;                    // placeholder or fully installed
+    bool isApplication = true;                     // false: a non-application bundle (kind 0 only)
+    std::optional<std::string> bundleDirectory{};  // under the root
+    std::optional<std::string> containerDirectory{};  // under the root
+    std::optional<std::string> iconPath{};
+    std::optional<std::uint64_t> staticDiskUsage{};
+    bool hasMIDBasedSINF = false;
+    plist::Dict lastInstallOptions{};  // options of the install that made it
+  };
+
+  struct InstallCall {
+    std::string path;
+    plist::Dict options;
+    bool placeholder;  // installApplication:withOptions: (true) or ...:error: (false)
+    bool succeeded;
+  };
+  struct UninstallCall {
+    std::string identifier;
+    std::optional<plist::Dict> options;
+    bool succeeded;
+  };
+
+  // Option of uninstallApplication: remove the application only if it is a placeholder.
+  static constexpr std::string_view kUninstallPlaceholdersOnlyKey = "UninstallPlaceholdersOnly";
+
+  // `root`: the device root under which packages get their containers.
+  explicit FakeARWorkspace(std::filesystem::path root);
+
+  // ---- Test API ----
+
+  // Adds or replaces a record (test setup; no events).
+  void putApplication(AppRecord record);
+  std::optional<AppRecord> application(const std::string& identifier) const;
+  std::vector<AppRecord> applications() const;
+  // Removes a record without events or files touched. False when there was none.
+  bool removeApplication(const std::string& identifier);
+
+  // Called with the identifier after every successful uninstall, outside the registry's lock.
+  void setUninstallHook(std::function<void(const std::string&)> hook);
+
+  // The container a package install uses for `identifier` (absent for one that would escape).
+  std::optional<std::string> containerDirectoryFor(const std::string& identifier) const;
+
+  // The progress object of the application's install in `phase` (created with that phase if
+  // needed) made the application's current one; null for an unknown application. Tests set its
+  // state and phase to shape what observers see.
+  std::shared_ptr<ARInstallProgress> installProgress(const std::string& identifier,
+                                                     std::uint64_t phase);
+  // Progress objects passed to installPhaseFinishedForProgress, in call order.
+  std::vector<std::shared_ptr<ARInstallProgress>> finishedPhases() const;
+
+  std::vector<InstallCall> installCalls() const;
+  std::vector<UninstallCall> uninstallCalls() const;
+
+  // The installs the registry reports as prioritized and paused, by identifier (identifiers
+  // without a record are left out of the reports). Each report carries fresh proxies.
+  void setInstallsInProgress(std::vector<std::string> prioritized, std::vector<std::string> paused);
+  // Delivers applicationInstallsArePrioritized with the current lists to every observer.
+  void notifyInstallsArePrioritized();
+  // Delivers applicationInstallsDidCancel with the proxies of the known identifiers.
+  void notifyInstallsDidCancel(const std::vector<std::string>& identifiers);
+
+  std::size_t observerCount() const;
+  // Waits until every event posted so far has been delivered.
+  void drain() { callbacks_.drain(); }
+  // Hold and release events.
+  CallbackThread& callbackThread() { return callbacks_; }
+
+  // ---- ARApplicationWorkspace ----
+
+  void addObserver(ARApplicationWorkspaceObserverProtocol* observer) override;
+  void removeObserver(ARApplicationWorkspaceObserverProtocol* observer) override;
+  bool applicationIsInstalled(const std::string& identifier) override;
+  bool uninstallApplication(const std::string& identifier,
+                            const std::optional<plist::Dict>& options) override;
+  // Placeholder install: PATH/Info.plist names the application ("BNBundleIdentifier",
+  // "BNBundleVersion", "BNBundleDisplayName", "BNBundleIconFile"); options must have
+  // PackageType "Placeholder", may have "BNBundleIdentifier" (must agree) and "ARInstallType".
+  bool installApplication(const std::string& path, const plist::Dict& options) override;
+  // Package install: PATH is a bundle directory with an Info.plist whose identifier agrees with
+  // options "BNBundleIdentifier". Errors are of the domain "AppRegistryError".
+  bool installApplication(const std::string& path, const plist::Dict& options,
+                          ErrorRef* error) override;
+  void enumerateBundlesOfType(int type, const BundleBlock& block) override;
+  std::shared_ptr<ARInstallProgress> installProgressForApplication(const ARApplicationProxy& proxy,
+                                                                   std::uint64_t phase) override;
+  void installPhaseFinishedForProgress(const std::shared_ptr<ARInstallProgress>& progress) override;
+  std::shared_ptr<const ARApplicationProxy> applicationProxyForIdentifier(
+      const std::string& identifier, bool placeholder) override;
+
+ private:
+  struct Entry {
+    AppRecord record;
+    std::shared_ptr<ARInstallProgress> currentProgress;
+  };
+  using ProxyEvent = void (ARApplicationWorkspaceObserverProtocol::*)(const ARProxyList&);
+
+  // All with mutex_ held.
+  Entry* findLocked(const std::string& identifier);
+  const Entry* findLocked(const std::string& identifier) const;
+  void putLocked(Entry entry);
+  void eraseLocked(const std::string& identifier);
+  std::shared_ptr<ARInstallProgress> progressLocked(const std::string& identifier,
+                                                    std::uint64_t phase);
+  ARProxyList proxiesLocked(const std::vector<std::string>& identifiers) const;
+  std::vector<std::uint64_t> registrationsLocked() const;
+
+  static std::shared_ptr<const ARBundleProxy> makeProxy(const Entry& entry);
+  static std::shared_ptr<const ARApplicationProxy> makeApplicationProxy(const Entry& entry);
+
+  // Posts `event` with `proxies` for each of `registrations` still registered at delivery.
+  void postEvent(std::vector<std::uint64_t> registrations, ProxyEvent event, ARProxyList proxies);
+  void postPrioritized(std::vector<std::uint64_t> registrations, ARProxyList prioritized,
+                       ARProxyList paused);
+  // The observer of a registration, or null once it has been removed.
+  ARApplicationWorkspaceObserverProtocol* observerFor(std::uint64_t registration) const;
+
+  bool installPlaceholder(const std::string& path, const plist::Dict& options);
+  bool installPackage(const std::string& path, const plist::Dict& options, ErrorRef* error);
+  void recordInstall(const std::string& path, const plist::Dict& options, bool placeholder,
+                     bool succeeded);
+
+  const std::filesystem::path root_;
+  mutable std::mutex mutex_;
+  std::vector<Entry> entries_;
+  std::map<std::pair<std::string, std::uint64_t>, std::shared_ptr<ARInstallProgress>> progress_;
+  std::vector<std::shared_ptr<ARInstallProgress>> finishedPhases_;
+  std::vector<InstallCall> installCalls_;
+  std::vector<UninstallCall> uninstallCalls_;
+  std::vector<std::string> prioritized_;
+  std::vector<std::string> paused_;
+  std::vector<std::pair<std::uint64_t, ARApplicationWorkspaceObserverProtocol*>> observers_;
+  std::uint64_t nextRegistration_ = 1;
+  std::function<void(const std::string&)> uninstallHook_;
+  CallbackThread callbacks_{"fake-ar-events"};  // last: stops first
+};
+
+}  // namespace appsync

@@ -1,0 +1,289 @@
+// PNG decoding of every kind, encoding round trips, and refusal of damaged or hostile files.
+#include "platform/icon/png_codec.h"
+
+#include <gtest/gtest.h>
+
+#include <chrono>
+#include <cstdlib>
+#include <functional>
+
+#include "platform/icon/png_fixtures.h"
+
+namespace appsync::icon {
+namespace {
+
+using testing::Bytes;
+using testing::RawPng;
+
+struct KindCase {
+  const char* name;
+  int colorType;
+  int bitDepth;
+  bool interlaced;
+  bool transparency;  // tRNS: palette alpha table, or one transparent gray/RGB colour
+};
+
+int channels(int colorType) {
+  switch (colorType) {
+    case PNG_COLOR_TYPE_GRAY_ALPHA:
+      return 2;
+    case PNG_COLOR_TYPE_RGB:
+      return 3;
+    case PNG_COLOR_TYPE_RGB_ALPHA:
+      return 4;
+    default:
+      return 1;
+  }
+}
+
+// A sample for pixel (x, y), channel c, spread over the depth's whole range.
+unsigned sampleAt(int x, int y, int c, int depth) {
+  const unsigned mixed = unsigned(x) * 7919u + unsigned(y) * 104729u + unsigned(c) * 1301u + 17u;
+  return mixed % (1u << depth);
+}
+
+std::uint8_t toEight(unsigned sample, int depth) {
+  const unsigned max = (1u << depth) - 1;
+  return static_cast<std::uint8_t>((sample * 255u + max / 2) / max);
+}
+
+png_color paletteColor(unsigned i) {
+  return {static_cast<png_byte>(i * 40 % 256), static_cast<png_byte>(i * 90 % 256 + 1),
+          static_cast<png_byte>(i * 150 % 256)};
+}
+
+// Builds the file and the RGBA8 it must decode to.
+std::pair<Bytes, Image> makeKind(const KindCase& k, int width, int height) {
+  RawPng raw;
+  raw.width = width;
+  raw.height = height;
+  raw.bitDepth = k.bitDepth;
+  raw.colorType = k.colorType;
+  raw.interlaced = k.interlaced;
+  const int n = channels(k.colorType);
+  const unsigned paletteSize =
+      k.colorType == PNG_COLOR_TYPE_PALETTE ? std::min(1u << k.bitDepth, 200u) : 0;
+  for (unsigned i = 0; i < paletteSize; ++i) raw.palette.push_back(paletteColor(i));
+  if (k.transparency && paletteSize > 0) {
+    // Shorter than the palette: the entries after it are opaque.
+    for (unsigned i = 0; i < (paletteSize + 1) / 2; ++i) {
+      raw.paletteAlpha.push_back(static_cast<std::uint8_t>(i * 60 % 256));
+    }
+  }
+  if (k.transparency && paletteSize == 0) {
+    raw.hasTransparentColor = true;
+    const unsigned g = sampleAt(1, 1, 0, k.bitDepth);
+    raw.transparentColor.gray = static_cast<png_uint_16>(g);
+    raw.transparentColor.red = static_cast<png_uint_16>(sampleAt(1, 1, 0, k.bitDepth));
+    raw.transparentColor.green = static_cast<png_uint_16>(sampleAt(1, 1, 1, k.bitDepth));
+    raw.transparentColor.blue = static_cast<png_uint_16>(sampleAt(1, 1, 2, k.bitDepth));
+  }
+
+  Image expected(width, height);
+  for (int y = 0; y < height; ++y) {
+    std::vector<unsigned> samples;
+    for (int x = 0; x < width; ++x) {
+      std::uint8_t* e = expected.pixel(x, y);
+      std::vector<unsigned> s;
+      for (int c = 0; c < n; ++c) s.push_back(sampleAt(x, y, c, k.bitDepth));
+      if (paletteSize > 0) s[0] %= paletteSize;
+      samples.insert(samples.end(), s.begin(), s.end());
+      switch (k.colorType) {
+        case PNG_COLOR_TYPE_PALETTE: {
+          const png_color p = paletteColor(s[0]);
+          e[0] = p.red, e[1] = p.green, e[2] = p.blue;
+          e[3] = s[0] < raw.paletteAlpha.size() ? raw.paletteAlpha[s[0]] : 255;
+          break;
+        }
+        case PNG_COLOR_TYPE_GRAY:
+        case PNG_COLOR_TYPE_GRAY_ALPHA:
+          e[0] = e[1] = e[2] = toEight(s[0], k.bitDepth);
+          e[3] = n == 2 ? toEight(s[1], k.bitDepth) : 255;
+          if (raw.hasTransparentColor && s[0] == raw.transparentColor.gray) e[3] = 0;
+          break;
+        default:
+          for (int c = 0; c < 3; ++c) e[c] = toEight(s[c], k.bitDepth);
+          e[3] = n == 4 ? toEight(s[3], k.bitDepth) : 255;
+          if (raw.hasTransparentColor && s[0] == raw.transparentColor.red &&
+              s[1] == raw.transparentColor.green && s[2] == raw.transparentColor.blue) {
+            e[3] = 0;
+          }
+      }
+    }
+    raw.rows.push_back(testing::packSamples(samples, k.bitDepth));
+  }
+  return {testing::writeRawPng(raw), expected};
+}
+
+TEST(PngDecodeTest, EveryKindDecodesToItsColours) {
+  const KindCase kinds[] = {
+      {"gray 1-bit", PNG_COLOR_TYPE_GRAY, 1, false, false},
+      {"gray 2-bit", PNG_COLOR_TYPE_GRAY, 2, false, false},
+      {"gray 4-bit", PNG_COLOR_TYPE_GRAY, 4, false, false},
+      {"gray 8-bit", PNG_COLOR_TYPE_GRAY, 8, false, false},
+      {"gray 16-bit", PNG_COLOR_TYPE_GRAY, 16, false, false},
+      {"gray 8-bit with transparent colour", PNG_COLOR_TYPE_GRAY, 8, false, true},
+      {"gray 16-bit with transparent colour", PNG_COLOR_TYPE_GRAY, 16, false, true},
+      {"gray+alpha 8-bit", PNG_COLOR_TYPE_GRAY_ALPHA, 8, false, false},
+      {"gray+alpha 16-bit", PNG_COLOR_TYPE_GRAY_ALPHA, 16, false, false},
+      {"RGB 8-bit", PNG_COLOR_TYPE_RGB, 8, false, false},
+      {"RGB 16-bit", PNG_COLOR_TYPE_RGB, 16, false, false},
+      {"RGB 8-bit with transparent colour", PNG_COLOR_TYPE_RGB, 8, false, true},
+      {"RGBA 8-bit", PNG_COLOR_TYPE_RGB_ALPHA, 8, false, false},
+      {"RGBA 16-bit", PNG_COLOR_TYPE_RGB_ALPHA, 16, false, false},
+      {"palette 1-bit", PNG_COLOR_TYPE_PALETTE, 1, false, false},
+      {"palette 4-bit with alpha", PNG_COLOR_TYPE_PALETTE, 4, false, true},
+      {"palette 8-bit", PNG_COLOR_TYPE_PALETTE, 8, false, false},
+      {"palette 8-bit with alpha", PNG_COLOR_TYPE_PALETTE, 8, false, true},
+      {"interlaced RGBA 8-bit", PNG_COLOR_TYPE_RGB_ALPHA, 8, true, false},
+      {"interlaced gray 16-bit", PNG_COLOR_TYPE_GRAY, 16, true, false},
+      {"interlaced palette 2-bit with alpha", PNG_COLOR_TYPE_PALETTE, 2, true, true},
+  };
+  for (const KindCase& k : kinds) {
+    SCOPED_TRACE(k.name);
+    // Odd sizes leave partial Adam7 passes and partial bytes at low depths.
+    const auto [file, expected] = makeKind(k, 13, 11);
+    ASSERT_FALSE(file.empty());
+    std::string why;
+    const std::optional<Image> image = decodePng(file, &why);
+    ASSERT_TRUE(image) << why;
+    ASSERT_EQ(image->width, 13);
+    ASSERT_EQ(image->height, 11);
+    int transparent = 0;
+    for (int y = 0; y < 11; ++y) {
+      for (int x = 0; x < 13; ++x) {
+        const std::uint8_t* got = image->pixel(x, y);
+        const std::uint8_t* want = expected.pixel(x, y);
+        transparent += want[3] == 0;
+        // Colour does not matter where alpha is zero.
+        const int checked = want[3] == 0 ? 3 : 0;
+        for (int c = checked; c < 4; ++c) {
+          // Sixteen-bit samples may round either way.
+          ASSERT_LE(std::abs(int(got[c]) - int(want[c])), k.bitDepth == 16 ? 1 : 0)
+              << "pixel " << x << "," << y << " channel " << c;
+        }
+      }
+    }
+    if (k.transparency) {
+      EXPECT_GT(transparent, 0);
+    }
+  }
+}
+
+TEST(PngEncodeTest, RoundTripsAndWritesPlainRgba) {
+  Image image(37, 19);
+  for (std::size_t i = 0; i < image.rgba.size(); ++i) {
+    image.rgba[i] = static_cast<std::uint8_t>(i * 2654435761u >> 13);
+  }
+  std::string why;
+  const auto png = encodePng(image, &why);
+  ASSERT_TRUE(png) << why;
+  const std::optional<PngHeader> header = readPngHeader(*png);
+  ASSERT_TRUE(header);
+  EXPECT_EQ(header->bitDepth, 8);
+  EXPECT_EQ(header->colorType, PNG_COLOR_TYPE_RGB_ALPHA);
+  EXPECT_FALSE(header->interlaced);
+  const std::optional<Image> back = decodePng(*png, &why);
+  ASSERT_TRUE(back) << why;
+  EXPECT_EQ(back->width, 37);
+  EXPECT_EQ(back->height, 19);
+  EXPECT_EQ(back->rgba, image.rgba);
+
+  Image broken(4, 4);
+  broken.rgba.resize(10);
+  EXPECT_FALSE(encodePng(broken, &why));
+  EXPECT_NE(why.find("wrong size"), std::string::npos) << why;
+  EXPECT_FALSE(encodePng(Image(), &why));
+}
+
+// Raw rows (filter byte 0, then RGBA8) for a width x rows image.
+Bytes rawRows(int width, int rows) {
+  Bytes raw;
+  for (int y = 0; y < rows; ++y) {
+    raw.push_back(0);
+    for (int x = 0; x < width * 4; ++x) raw.push_back(static_cast<std::uint8_t>(x + y));
+  }
+  return raw;
+}
+
+Bytes withByte(Bytes bytes, std::size_t offset, std::uint8_t xorMask) {
+  bytes.at(offset) ^= xorMask;
+  return bytes;
+}
+
+TEST(PngDecodeTest, RefusesDamagedAndHostileFiles) {
+  using testing::chunk;
+  using testing::ihdr;
+  using testing::pngFromChunks;
+  using testing::zlibCompress;
+  const Bytes good = *encodePng(testing::solidImage(16, 16, 10, 20, 30));
+  const std::size_t idat = testing::findChunk(good, "IDAT");
+  const std::size_t idatLength = (good[idat + 2] << 8) | good[idat + 3];
+  ASSERT_GT(idat, 0u);
+  const Bytes ihdr16 = ihdr(16, 16, 8, PNG_COLOR_TYPE_RGB_ALPHA);
+  const Bytes iend = chunk("IEND", {});
+  auto withIdat = [&](const Bytes& compressed) {
+    return pngFromChunks({ihdr16, chunk("IDAT", compressed), iend});
+  };
+  // The same compressed stream with a byte in the middle of the deflate data changed.
+  Bytes corruptStream = zlibCompress(rawRows(16, 16));
+  corruptStream[corruptStream.size() / 2] ^= 0x5a;
+  Bytes badTextChunk = chunk("tEXt", Bytes{'a', 0, 'b'});
+  badTextChunk.back() ^= 1;
+
+  struct Case {
+    const char* name;
+    Bytes file;
+    const char* message;  // part of the reason
+  };
+  const Case cases[] = {
+      {"empty", {}, "bad signature"},
+      {"not a PNG", {'G', 'I', 'F', '8', '9', 'a', 0, 0, 0, 0}, "bad signature"},
+      {"cut inside IHDR", Bytes(good.begin(), good.begin() + 20), "truncated"},
+      {"cut inside IDAT", Bytes(good.begin(), good.begin() + idat + 20), "truncated"},
+      {"IEND missing", Bytes(good.begin(), good.end() - 12), "truncated"},
+      {"IHDR CRC", withByte(good, 8 + 8 + 13, 0x01), "CRC"},
+      {"IDAT CRC", withByte(good, idat + 8 + idatLength, 0x80), "CRC"},
+      {"ancillary chunk CRC",
+       pngFromChunks({ihdr16, badTextChunk, chunk("IDAT", zlibCompress(rawRows(16, 16))), iend}),
+       "CRC"},
+      {"bad zlib header", withIdat([&] {
+         Bytes z = zlibCompress(rawRows(16, 16));
+         z[0] = 0x00;
+         return z;
+       }()),
+       "PNG decode failed"},
+      {"bad deflate data", withIdat(corruptStream), "PNG decode failed"},
+      {"not enough image data", withIdat(zlibCompress(rawRows(16, 15))), "PNG decode failed"},
+      {"too much image data", withIdat(zlibCompress(rawRows(16, 17))), "PNG decode failed"},
+      {"unknown critical chunk",
+       pngFromChunks(
+           {ihdr16, chunk("QUUX", {1, 2}), chunk("IDAT", zlibCompress(rawRows(16, 16))), iend}),
+       "PNG decode failed"},
+      {"no image data", pngFromChunks({ihdr16, iend}), "no IDAT"},
+      {"zero width", pngFromChunks({ihdr(0, 16, 8, 6), iend}), "invalid dimensions"},
+      {"RGB at 4 bits", pngFromChunks({ihdr(16, 16, 4, 2), iend}), "unsupported IHDR"},
+      {"100000 x 100000",
+       pngFromChunks(
+           {ihdr(100000, 100000, 8, 6), chunk("IDAT", zlibCompress(rawRows(16, 1))), iend}),
+       "limit is 8192 x 8192"},
+      {"9000 wide", pngFromChunks({ihdr(9000, 1, 8, 6), iend}), "limit is 8192 x 8192"},
+      {"8000 x 8000", pngFromChunks({ihdr(8000, 8000, 8, 6), iend}), "32 Mpixel"},
+      {"4000 x 4000 with a few bytes of data",
+       pngFromChunks({ihdr(4000, 4000, 8, 6), chunk("IDAT", zlibCompress(rawRows(16, 1))), iend}),
+       "cannot hold"},
+  };
+  for (const Case& c : cases) {
+    SCOPED_TRACE(c.name);
+    std::string why;
+    const auto start = std::chrono::steady_clock::now();
+    EXPECT_FALSE(decodePng(c.file, &why));
+    const auto elapsed = std::chrono::steady_clock::now() - start;
+    EXPECT_NE(why.find(c.message), std::string::npos) << why;
+    // Refused on the header: nothing of the declared size is allocated or filled.
+    EXPECT_LT(elapsed, std::chrono::milliseconds(250));
+  }
+}
+
+}  // namespace
+}  // namespace appsync::icon
