@@ -80,6 +80,9 @@ AppsClient::~AppsClient() {
     _appInstallObserver.reset();
   }
 
+  // The coordination service holds the client as an observer of its coordinators.
+  platform_.kc.removeObserver(this);
+
   // Install operations hold the client; none may outlive it.
   _installOperationQueue.reset();
 }

@@ -186,6 +186,10 @@ class KCInstallCoordination {
   virtual std::shared_ptr<KCAppInstallObserver> initAppInstallObserver(
       const std::string& machServiceName, const std::set<std::uint64_t>& clients,
       KCAppInstallObserverDelegate* delegate) = 0;
+  // Stops every event to `observer`, as a coordinator observer and as a delegate: after this
+  // returns no event for it is running or will run. Observers call this before they go away
+  // (the service holds them without owning them).
+  virtual void removeObserver(const KCAppInstallObserverDelegate* observer) = 0;
   // A user-presentable error of the service wrapping `underlying`.
   virtual ErrorRef KCCreateUserPresentableError(std::int64_t code, std::int64_t detail,
                                                 const ErrorRef& underlying) = 0;

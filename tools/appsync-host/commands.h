@@ -7,5 +7,7 @@ namespace appsync::host {
 
 // Each returns the process exit status through `status` once its subcommand has run.
 void addPlistCommands(CLI::App& app, int& status);
+void addIconCommand(CLI::App& app, int& status);
+void addDemoCommand(CLI::App& app, int& status);
 
 }  // namespace appsync::host

@@ -92,6 +92,10 @@ bool BinaryWriter::number(const Value& root) {
       }
       continue;
     }
+    if (obj.value->isNull()) {
+      error_ = "a property list cannot carry null";
+      return false;
+    }
     const std::uint32_t depth = depth_[i];
     if ((obj.value->array() || obj.value->dict()) && depth > kMaxDepth) {
       error_ = "containers nested deeper than " + std::to_string(kMaxDepth) + " levels";
@@ -179,6 +183,8 @@ void BinaryWriter::writeObject(std::size_t index) {
     }
     case Type::String:
       break;  // written above, as a shared string object
+    case Type::Null:
+      break;  // refused while numbering
   }
 }
 

@@ -118,6 +118,7 @@ const char* typeName(Type type) {
     case Type::Uid: return "uid";
     case Type::Array: return "array";
     case Type::Dict: return "dictionary";
+    case Type::Null: return "null";
   }
   return "unknown";
 }
@@ -221,6 +222,7 @@ void describeDate(const Date& date, std::string& out) {
 
 void describeInto(const Value& v, std::string& out) {
   switch (v.type()) {
+    case Type::Null: out += "<null>"; break;
     case Type::Boolean: out += *v.boolean() ? "1" : "0"; break;
     case Type::Integer: {
       const Integer& i = *v.integer();

@@ -100,7 +100,13 @@ class Dict {
   static constexpr std::size_t kIndexThreshold = 16;
 };
 
-enum class Type { Boolean, Integer, Real, String, Data, Date, Uid, Array, Dict };
+// Null is the platform's null object: it may stand in a dictionary built in memory (install
+// options), but a property list cannot carry it, so every writer refuses it.
+enum class Type { Boolean, Integer, Real, String, Data, Date, Uid, Array, Dict, Null };
+
+struct Null {
+  bool operator==(const Null&) const = default;
+};
 
 const char* typeName(Type type);
 
@@ -124,6 +130,8 @@ class Value {
   Value(Uid u) : v_(u) {}
   Value(Array a) : v_(std::move(a)) {}
   Value(Dict d) : v_(std::move(d)) {}
+  Value(Null n) : v_(n) {}
+  static Value null() { return Value(Null{}); }
 
   Type type() const { return static_cast<Type>(v_.index()); }
 
@@ -140,6 +148,7 @@ class Value {
   Array* array() { return std::get_if<Array>(&v_); }
   const Dict* dict() const { return std::get_if<Dict>(&v_); }
   Dict* dict() { return std::get_if<Dict>(&v_); }
+  bool isNull() const { return std::holds_alternative<Null>(v_); }
 
   std::optional<std::int64_t> int64() const;
   std::optional<std::uint64_t> uint64() const;
@@ -157,7 +166,7 @@ class Value {
   bool operator==(const Value& other) const { return v_ == other.v_; }
 
  private:
-  std::variant<bool, Integer, double, std::string, Bytes, Date, Uid, Array, Dict> v_;
+  std::variant<bool, Integer, double, std::string, Bytes, Date, Uid, Array, Dict, Null> v_;
 };
 
 struct Dict::Entry {

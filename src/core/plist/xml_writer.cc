@@ -100,6 +100,8 @@ bool XmlWriter::escaped(std::string_view s) {
 bool XmlWriter::value(const Value& v) {
   indent();
   switch (v.type()) {
+    case Type::Null:
+      return fail("a property list cannot carry null");
     case Type::Boolean:
       out_ += *v.boolean() ? "<true/>\n" : "<false/>\n";
       return true;

@@ -136,7 +136,7 @@ class FakeKCInstallCoordination final : public KCInstallCoordination, public Fak
 
   // After this returns, no event for `observer` is running or will be delivered as a
   // coordinator observer (registrations are dropped with their KCAppInstallObserver).
-  void removeObserver(const KCAppInstallObserverDelegate* observer);
+  void removeObserver(const KCAppInstallObserverDelegate* observer) override;
 
   // Blocks until the event thread has nothing left to do (or is held and idle). Must not be
   // called from a callback.

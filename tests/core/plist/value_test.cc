@@ -1,5 +1,6 @@
 // Property-list values: dictionary order and indexing, truth values, descriptions.
 #include "core/plist/value.h"
+#include "core/plist/codec.h"
 
 #include <gtest/gtest.h>
 
@@ -126,6 +127,32 @@ TEST(ValueTest, IntegersKeepSignedness) {
   // The same bits, one signed and one unsigned, are different values.
   EXPECT_NE(Value(Integer{~0ull, false}), Value(Integer{~0ull, true}));
   EXPECT_EQ(Value(std::uint64_t{5}), Value(5));
+}
+
+}  // namespace
+}  // namespace appsync::plist
+
+namespace appsync::plist {
+namespace {
+
+TEST(NullValueTest, WritersRefuseNullWhereverItStands) {
+  const std::vector<Value> values = {
+      Value::null(),
+      Value(Array{1, Value::null()}),
+      Value(Dict{{"SINF", Value::null()}, {"name", "x"}}),
+  };
+  for (const Value& v : values) {
+    SCOPED_TRACE(v.describe());
+    std::string error;
+    EXPECT_FALSE(writeBinary(v, &error));
+    EXPECT_NE(error.find("cannot carry null"), std::string::npos) << error;
+    error.clear();
+    EXPECT_FALSE(writeXml(v, &error));
+    EXPECT_NE(error.find("cannot carry null"), std::string::npos) << error;
+  }
+  EXPECT_EQ(Value::null().describe(), "<null>");
+  EXPECT_TRUE(Value::null().isNull());
+  EXPECT_EQ(Value::null().truthValue(), std::nullopt);
 }
 
 }  // namespace
