@@ -79,8 +79,6 @@ TEST(CodecTest, XmlTextIsExact) {
   };
   const std::string expected =
       "<?xml version=\"1.0\" encoding=\"UTF-8\"?>\n"
-      "<!DOCTYPE plist PUBLIC \"-//Apple//DTD PLIST 1.0//EN\" "
-      "\"http://www.apple.com/DTDs/PropertyList-1.0.dtd\">\n"
       "<plist version=\"1.0\">\n"
       "<dict>\n"
       "\t<key>name</key>\n"
@@ -286,8 +284,8 @@ TEST(CodecTest, XmlReaderAcceptsTheUsualForms) {
        "&apos;&#x41;&#66;<![CDATA[<raw>]]></string></plist>",
        "a&<>\"'AB<raw>"},
       // The standard DOCTYPE, and no version attribute.
-      {"<!DOCTYPE plist PUBLIC \"-//Apple//DTD PLIST 1.0//EN\" "
-       "\"http://www.apple.com/DTDs/PropertyList-1.0.dtd\"><plist><true/></plist>",
+      {"<!DOCTYPE plist PUBLIC \"-//Example//DTD PLIST 1.0//EN\" "
+       "\"http://example.invalid/PropertyList-1.0.dtd\"><plist><true/></plist>",
        true},
       // No <plist> wrapper at all.
       {"<dict><key>a</key><integer>1</integer></dict>", Dict{{"a", 1}}},

@@ -173,8 +173,8 @@ std::vector<Case> hostileCases() {
            "<plist><true/></plist>"),
        {"line 1", "parameter entity declaration \"p\" is not allowed"}},
       {"undeclared entity behind an external DTD",
-       xml("<!DOCTYPE plist PUBLIC \"-//Apple//DTD PLIST 1.0//EN\" "
-           "\"http://www.apple.com/DTDs/PropertyList-1.0.dtd\">\n"
+       xml("<!DOCTYPE plist PUBLIC \"-//Example//DTD PLIST 1.0//EN\" "
+           "\"http://example.invalid/PropertyList-1.0.dtd\">\n"
            "<plist><string>&secret;</string></plist>"),
        {"line 2, column 16: reference to undeclared entity &secret;"}},
       {"undeclared entity", inPlist("<string>&secret;</string>"), {"line 3", "undefined entity"}},
