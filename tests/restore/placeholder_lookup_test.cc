@@ -1,0 +1,150 @@
+// Placeholder lookup: one application's, all of them with a callback, and system placeholders.
+#include <gtest/gtest.h>
+
+#include "restore/placeholder_fixture.h"
+
+namespace appsync {
+namespace {
+
+using testing::PlaceholderDevice;
+using testing::pluginLine;
+using AppRecord = FakeARWorkspace::AppRecord;
+
+// The device's registry, except that enumeration hands out a fixed list of bundles (which may
+// repeat an identifier, as no real registry record can) and counts the bundles it visits.
+class ListedBundles final : public ARApplicationWorkspace {
+ public:
+  ListedBundles(ARApplicationWorkspace& base,
+                std::vector<std::shared_ptr<const ARBundleProxy>> list)
+      : base_(base), list_(std::move(list)) {}
+
+  void enumerateBundlesOfType(int type, const BundleBlock& block) override {
+    types.push_back(type);
+    bool stop = false;
+    for (const auto& proxy : list_) {
+      ++visited;
+      block(proxy, &stop);
+      if (stop) break;
+    }
+  }
+  void addObserver(ARApplicationWorkspaceObserverProtocol* o) override { base_.addObserver(o); }
+  void removeObserver(ARApplicationWorkspaceObserverProtocol* o) override {
+    base_.removeObserver(o);
+  }
+  bool applicationIsInstalled(const std::string& id) override {
+    return base_.applicationIsInstalled(id);
+  }
+  bool uninstallApplication(const std::string& id,
+                            const std::optional<plist::Dict>& options) override {
+    return base_.uninstallApplication(id, options);
+  }
+  bool installApplication(const std::string& path, const plist::Dict& options) override {
+    return base_.installApplication(path, options);
+  }
+  bool installApplication(const std::string& path, const plist::Dict& options,
+                          ErrorRef* error) override {
+    return base_.installApplication(path, options, error);
+  }
+  std::shared_ptr<ARInstallProgress> installProgressForApplication(const ARApplicationProxy& p,
+                                                                   std::uint64_t phase) override {
+    return base_.installProgressForApplication(p, phase);
+  }
+  void installPhaseFinishedForProgress(const std::shared_ptr<ARInstallProgress>& p) override {
+    base_.installPhaseFinishedForProgress(p);
+  }
+  std::shared_ptr<const ARApplicationProxy> applicationProxyForIdentifier(
+      const std::string& id, bool placeholder) override {
+    return base_.applicationProxyForIdentifier(id, placeholder);
+  }
+
+  std::vector<int> types;
+  int visited = 0;
+
+ private:
+  ARApplicationWorkspace& base_;
+  std::vector<std::shared_ptr<const ARBundleProxy>> list_;
+};
+
+std::shared_ptr<const ARBundleProxy> application(const std::string& id, bool placeholder) {
+  auto proxy = std::make_shared<ARApplicationProxy>();
+  proxy->bundleIdentifier = id;
+  proxy->appState.isPlaceholder = placeholder;
+  return proxy;
+}
+
+TEST(PlaceholderLookupTest, ExistsStopsAtTheFirstMatchAndComparesExactly) {
+  testing::TempDir root;
+  FakePlatform device(root.path());
+  ListedBundles bundles(
+      device.ar(), {application("other", true), application("com.Example.App", true),
+                    application("com.example.app", false), application("com.example.app", true),
+                    application("last", true)});
+  const Platform& base = device.platform();
+  const Platform platform{base.tr,     bundles,   base.kc, base.em, base.sw,
+                          base.rs,     base.bz,   base.pv, base.qi, base.transactionLog,
+                          base.system, base.paths};
+  AppsClient client(platform);
+
+  // Any application with the identifier counts, placeholder or not; the walk ends there.
+  EXPECT_TRUE(client._placeholderExistsForApplication("com.example.app"));
+  EXPECT_EQ(bundles.visited, 3);
+  EXPECT_EQ(bundles.types, std::vector<int>{ARBundleTypeApplications});
+  EXPECT_EQ(device.log().count(pluginLine("Found placeholder for bundle com.example.app")), 1u);
+
+  bundles.visited = 0;
+  EXPECT_FALSE(client._placeholderExistsForApplication("com.example.APP"));
+  EXPECT_EQ(bundles.visited, 5);
+  EXPECT_TRUE(testing::linesStartingWith(device.log(),
+                                         pluginLine("Found placeholder for bundle com.example.APP"))
+                  .empty());
+}
+
+TEST(PlaceholderLookupTest, CoordinatedRoadAnswersNoWithoutAsking) {
+  testing::TempDir root;
+  FakePlatform device(root.path(), FakePlatform::Options{.coordination = true});
+  device.ar().putApplication({.identifier = "a", .isPlaceholder = true});
+  AppsClient client(device.platform());
+  EXPECT_FALSE(client._placeholderExistsForApplication("a"));
+  EXPECT_EQ(device.ar().callCount("enumerateBundlesOfType:block:"), 0u);
+  EXPECT_TRUE(testing::linesStartingWith(device.log(), pluginLine("Found")).empty());
+}
+
+TEST(PlaceholderLookupTest, EnumerationVisitsOnlyApplicationPlaceholders) {
+  PlaceholderDevice d;
+  FakeARWorkspace& ar = d.device.ar();
+  ar.putApplication({.identifier = "bundle", .isPlaceholder = true, .isApplication = false});
+  ar.putApplication({.identifier = "installed"});
+  ar.putApplication({.identifier = "p1", .isPlaceholder = true});
+  ar.putApplication({.identifier = "sys", .applicationType = "System", .isPlaceholder = true});
+
+  std::vector<std::string> seen;
+  d.client._enumeratePlaceholdersWithBlock([&](const auto& proxy, bool*) {
+    ASSERT_TRUE(proxy);
+    seen.push_back(proxy->applicationIdentifier);
+  });
+  EXPECT_EQ(seen, (std::vector<std::string>{"p1", "sys"}));
+
+  seen.clear();
+  d.client._enumeratePlaceholdersWithBlock([&](const auto& proxy, bool* stop) {
+    seen.push_back(proxy->bundleIdentifier);
+    *stop = true;
+  });
+  EXPECT_EQ(seen, std::vector<std::string>{"p1"});
+}
+
+TEST(PlaceholderLookupTest, SystemPlaceholdersAreCollectedAndLogged) {
+  PlaceholderDevice d;
+  EXPECT_TRUE(d.client._getSystemAppPlaceholders().empty());
+  EXPECT_EQ(d.device.log().count(pluginLine("SystemAppPlaceholders ()")), 1u);
+
+  FakeARWorkspace& ar = d.device.ar();
+  ar.putApplication({.identifier = "z.sys", .applicationType = "System", .isPlaceholder = true});
+  ar.putApplication({.identifier = "a.sys", .applicationType = "System", .isPlaceholder = true});
+  ar.putApplication({.identifier = "installed.sys", .applicationType = "System"});
+  ar.putApplication({.identifier = "user", .isPlaceholder = true});
+  EXPECT_EQ(d.client._getSystemAppPlaceholders(), (std::set<std::string>{"a.sys", "z.sys"}));
+  EXPECT_EQ(d.device.log().count(pluginLine("SystemAppPlaceholders (a.sys, z.sys)")), 1u);
+}
+
+}  // namespace
+}  // namespace appsync
