@@ -31,8 +31,8 @@ int renderIcon(const std::string& bundleDir, const std::string& out, int size) {
 }  // namespace
 
 void addIconCommand(CLI::App& app, int& status) {
-  auto* command = app.add_subcommand(
-      "icon", "Render an application bundle's home-screen icon as a PNG file");
+  auto* command =
+      app.add_subcommand("icon", "Render an application bundle's home-screen icon as a PNG file");
   auto bundleDir = std::make_shared<std::string>();
   auto out = std::make_shared<std::string>();
   auto size = std::make_shared<int>(HomeScreenIconService::kDefaultIconSize);
@@ -42,9 +42,8 @@ void addIconCommand(CLI::App& app, int& status) {
   command->add_option("--size", *size, "Icon side in pixels")
       ->capture_default_str()
       ->check(CLI::Range(1, HomeScreenIconService::kMaxIconSize));
-  command->callback([bundleDir, out, size, &status] {
-    status = renderIcon(*bundleDir, *out, *size);
-  });
+  command->callback(
+      [bundleDir, out, size, &status] { status = renderIcon(*bundleDir, *out, *size); });
 }
 
 }  // namespace appsync::host

@@ -1,0 +1,134 @@
+// Rendering an installed bundle's icon to a PNG file: every failure step with its message and
+// no file damage, and a successful rendering that decodes to the device's icon.
+#include <gtest/gtest.h>
+
+#include <filesystem>
+#include <functional>
+#include <string>
+#include <vector>
+
+#include "core/apps_client.h"
+#include "core/fs/files.h"
+#include "platform/fake/fake_platform.h"
+#include "platform/icon/png_codec.h"
+#include "support/temp_dir.h"
+
+namespace appsync {
+namespace {
+
+namespace fs = std::filesystem;
+
+void writeText(const fs::path& path, std::string_view text) {
+  ASSERT_TRUE(writeFileAtomically(
+      path.string(), std::span(reinterpret_cast<const std::uint8_t*>(text.data()), text.size())));
+}
+
+// An application bundle whose Info.plist names one 180 x 180 icon of a single colour.
+std::string makeBundle(const fs::path& bundle) {
+  fs::create_directories(bundle);
+  writeText(bundle / "Info.plist",
+            "<?xml version=\"1.0\" encoding=\"UTF-8\"?>\n"
+            "<plist version=\"1.0\"><dict>\n"
+            "<key>BNBundleIdentifier</key><string>com.example.app</string>\n"
+            "<key>BNBundleIconFiles</key><array><string>AppIcon</string></array>\n"
+            "</dict></plist>\n");
+  icon::Image image(180, 180);
+  for (std::size_t i = 0; i < image.rgba.size(); i += 4) {
+    image.rgba[i] = 30;
+    image.rgba[i + 1] = 144;
+    image.rgba[i + 2] = 255;
+    image.rgba[i + 3] = 255;
+  }
+  const auto png = icon::encodePng(image).value_or(plist::Bytes{});
+  EXPECT_FALSE(png.empty());
+  EXPECT_TRUE(writeFileAtomically((bundle / "AppIcon.png").string(), png));
+  return bundle.string();
+}
+
+TEST(IconRenderingTest, EachFailingStepHasItsMessageAndWritesNothing) {
+  const plist::Bytes previous = {'o', 'l', 'd'};
+  struct Case {
+    const char* name;
+    std::function<std::optional<std::string>(const std::string& bundle, const fs::path& dir)>
+        bundlePath;
+    std::optional<QIStep> fault;
+    bool destinationDirectoryExists;
+    std::string message;  // after the prefix; the destination is appended when empty
+  };
+  const Case cases[] = {
+      {"absent path", [](auto&, auto&) { return std::nullopt; }, std::nullopt, true,
+       "missing bundlePath"},
+      {"empty path", [](auto&, auto&) { return std::string(); }, std::nullopt, true,
+       "couldn't create URL"},
+      {"no such directory", [](auto&, const fs::path& dir) { return (dir / "Gone.app").string(); },
+       std::nullopt, true, "couldn't create bundle from URL"},
+      {"bundle cannot be opened", [](const std::string& b, auto&) { return b; }, QIStep::OpenBundle,
+       true, "couldn't create bundle from URL"},
+      {"directory that is no application", [](auto&, const fs::path& dir) { return dir.string(); },
+       std::nullopt, true, "couldn't create PV icon from bundle"},
+      {"icon cannot be rendered", [](const std::string& b, auto&) { return b; }, QIStep::RenderIcon,
+       true, "couldn't create PV icon from bundle"},
+      {"no encoder", [](const std::string& b, auto&) { return b; }, QIStep::CreateImageDestination,
+       true, "couldn't create image"},
+      {"encoder fails", [](const std::string& b, auto&) { return b; }, QIStep::Finalize, true,
+       "Couldn't finalize image"},
+      {"destination directory missing", [](const std::string& b, auto&) { return b; }, std::nullopt,
+       false, ""},
+  };
+  for (const Case& c : cases) {
+    SCOPED_TRACE(c.name);
+    testing::TempDir root;
+    FakePlatform device(root.path());
+    const std::string bundle = makeBundle(root.path() / "Apps" / "Example.app");
+    const fs::path outDir = root.path() / (c.destinationDirectoryExists ? "out" : "missing");
+    const std::string saveTo = (outDir / "com.example.app.png").string();
+    if (c.destinationDirectoryExists) {
+      fs::create_directories(outDir);
+      ASSERT_TRUE(writeFileAtomically(saveTo, previous));
+    }
+    if (c.fault) device.qi().failNext(*c.fault);
+
+    EXPECT_FALSE(AppsClient::_makeIconFromBundlePath(device.platform(),
+                                                     c.bundlePath(bundle, root.path()), saveTo));
+
+    const std::string message =
+        c.message.empty() ? "Couldn't save image file to " + saveTo : c.message;
+    EXPECT_EQ(device.log().messages(),
+              std::vector<std::string>{"com.vantor.trc.AppSync|" + message});
+    for (const auto& line : device.log().lines()) EXPECT_EQ(line.level, LogLevel::Error);
+    if (c.destinationDirectoryExists) {
+      EXPECT_EQ(readFile(saveTo), previous);
+      EXPECT_EQ(std::distance(fs::directory_iterator(outDir), fs::directory_iterator()), 1);
+    } else {
+      EXPECT_FALSE(fs::exists(outDir));
+    }
+  }
+}
+
+TEST(IconRenderingTest, WritesTheDeviceIconAsOnePng) {
+  testing::TempDir root;
+  FakePlatform device(root.path());
+  const std::string bundle = makeBundle(root.path() / "Example.app");
+  const std::string saveTo = root / "icon.png";
+  ASSERT_TRUE(writeFileAtomically(saveTo, plist::Bytes{'o', 'l', 'd'}));
+
+  ASSERT_TRUE(AppsClient::_makeIconFromBundlePath(device.platform(), bundle, saveTo));
+
+  EXPECT_TRUE(device.log().messages().empty());
+  const plist::Bytes png = readFile(saveTo).value_or(plist::Bytes{});
+  const plist::Bytes signature = {0x89, 'P', 'N', 'G', '\r', '\n', 0x1a, '\n'};
+  ASSERT_GE(png.size(), signature.size());
+  EXPECT_TRUE(std::equal(signature.begin(), signature.end(), png.begin()));
+  std::string why;
+  const auto image = icon::decodePng(png, &why);
+  ASSERT_TRUE(image) << why;
+  EXPECT_EQ(image->width, 120);
+  EXPECT_EQ(image->height, 120);
+  EXPECT_EQ(image->pixel(0, 0)[3], 0);
+  EXPECT_EQ(image->pixel(119, 119)[3], 0);
+  const std::uint8_t* centre = image->pixel(60, 60);
+  EXPECT_EQ(std::vector<int>(centre, centre + 4), (std::vector<int>{30, 144, 255, 255}));
+}
+
+}  // namespace
+}  // namespace appsync
