@@ -13,6 +13,7 @@
 #include <string>
 
 #include "core/fs/files.h"
+#include "fuzz_support.h"
 #include "core/plist/codec.h"
 #include "transfer/restore_state_store.h"
 
@@ -20,23 +21,9 @@ namespace {
 
 using namespace appsync;
 
-[[noreturn]] void fail(const char* what, const std::string& detail = {}) {
-  std::fprintf(stderr, "%s%s%s\n", what, detail.empty() ? "" : ": ", detail.c_str());
-  std::abort();
-}
+using fuzz::fail;
 
-// One directory per process, created on first use and removed at exit; never destroyed, so
-// that the exit handler can still name it.
-const std::string& workDir() {
-  static const std::string* dir = [] {
-    const char* tmp = std::getenv("TMPDIR");
-    std::string pattern = std::string(tmp && *tmp ? tmp : "/tmp") + "/restore_state_fuzz.XXXXXX";
-    if (!::mkdtemp(pattern.data())) fail("cannot create the work directory");
-    std::atexit([] { removeAll(workDir()); });
-    return new std::string(pattern);
-  }();
-  return *dir;
-}
+const std::string& workDir() { return fuzz::workDir("restore_state_fuzz"); }
 
 std::optional<plist::Bytes> contents(const std::string& path) {
   return fileExists(path) ? readFile(path) : std::nullopt;
