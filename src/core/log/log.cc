@@ -143,12 +143,12 @@ void appendArg(std::string& out, Conversion conversion, const LogArg* arg) {
 // Recognises the specifier that starts right after a '%'. Returns its length (0 when it is not
 // one of ours) and its conversion.
 std::size_t matchSpecifier(std::string_view rest, Conversion* conversion) {
-  struct Spec {
+  struct Spelling {
     std::string_view text;
     Conversion conversion;
   };
   // Longer spellings first, so that "ld" is not taken for a "l" prefix of something else.
-  static constexpr Spec kSpecs[] = {
+  static constexpr Spelling kSpellings[] = {
       {"{private}@", Conversion::Private},
       {"{public}@", Conversion::Object},
       {"lld", Conversion::Integer},
@@ -165,10 +165,10 @@ std::size_t matchSpecifier(std::string_view rest, Conversion* conversion) {
       {"f", Conversion::Real},
       {"c", Conversion::Char},
   };
-  for (const Spec& spec : kSpecs) {
-    if (rest.starts_with(spec.text)) {
-      *conversion = spec.conversion;
-      return spec.text.size();
+  for (const Spelling& spelling : kSpellings) {
+    if (rest.starts_with(spelling.text)) {
+      *conversion = spelling.conversion;
+      return spelling.text.size();
     }
   }
   return 0;
