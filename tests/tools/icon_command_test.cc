@@ -9,6 +9,7 @@
 
 #include "core/fs/files.h"
 #include "platform/icon/png_codec.h"
+#include "support/host_process.h"
 #include "support/temp_dir.h"
 
 namespace appsync {
@@ -40,18 +41,8 @@ void makeBundle(const fs::path& bundle) {
   ASSERT_TRUE(writeFileAtomically((bundle / "AppIcon60x60@2x.png").string(), *png));
 }
 
-struct HostRun {
-  int status;
-  std::string stderrText;
-};
-
-HostRun runHost(const std::string& host, const std::string& arguments, const fs::path& scratch) {
-  const std::string errFile = (scratch / "stderr.txt").string();
-  const std::string command = "'" + host + "' " + arguments + " >/dev/null 2>'" + errFile + "'";
-  const int raw = std::system(command.c_str());
-  auto err = readFile(errFile).value_or(plist::Bytes{});
-  return {WIFEXITED(raw) ? WEXITSTATUS(raw) : -1, std::string(err.begin(), err.end())};
-}
+using testing::HostRun;
+using testing::runHost;
 
 TEST(IconCommandTest, RendersAtTheAskedSizeOrSaysWhyNot) {
   // Set by the build for this test binary.
