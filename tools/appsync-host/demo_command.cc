@@ -7,6 +7,7 @@
 #include "commands.h"
 #include "core/apps_client.h"
 #include "core/fs/files.h"
+#include "core/plist/codec.h"
 #include "platform/fake/fake_platform.h"
 
 namespace appsync::host {
@@ -73,7 +74,34 @@ int runDemo(const std::string& root) {
   auto list = AppsClient::_loadPlist(device.tr(), paths.todoList(), nullptr);
   std::printf("   todo list now: %s\n", list ? plist::Value(*list).describe().c_str() : "(none)");
 
-  std::printf("4. A restore package waits for its data; its path is remembered, then dropped.\n");
+  std::printf("4. The sync starts; downloads follow the home screen's icon order.\n");
+  AppsClient::_notifyPavilion(device.platform(), true);
+  const std::string syncNotification = "com.vantor.pavilion.trc.wsyncnotify";
+  std::printf("   home screen sync state: %llu\n",
+              static_cast<unsigned long long>(
+                  device.system().notificationState(syncNotification).value_or(0)));
+  device.pv().setIconOrder({"com.example.maps", "com.example.clock", "com.example.notes"});
+  plist::Dict candidates;
+  for (const char* id : {"com.example.notes", "com.example.weather", "com.example.maps"}) {
+    candidates.set(id, plist::Dict{{"BNBundleIdentifier", id}});
+  }
+  plist::Array order = AppsClient::_orderTheItems(device.platform(), candidates);
+  std::printf("   download order: %s\n", plist::Value(order).describe().c_str());
+
+  std::printf("5. A restored app gets a placeholder on the home screen.\n");
+  plist::Dict metadata{{"title", "Weather"}, {"bundleVersion", "2.1"}, {"itemName", "Weather"}};
+  auto metadataBytes = plist::writeBinary(plist::Value(metadata));
+  client->_processCaravelRestoreInfoForApp("com.example.weather", *metadataBytes, std::nullopt,
+                                           std::nullopt);
+  if (auto placeholder = device.ar().application("com.example.weather")) {
+    std::printf("   registry: %s is a placeholder named %s, version %s, install type %llu\n",
+                placeholder->identifier.c_str(), placeholder->name.value_or("?").c_str(),
+                placeholder->version.value_or("?").c_str(),
+                static_cast<unsigned long long>(placeholder->installType));
+  }
+  AppsClient::_notifyPavilion(device.platform(), false);
+
+  std::printf("6. A restore package waits for its data; its path is remembered, then dropped.\n");
   client->_setRestoreStatePropertyValue("/var/mobile/Media/PublicStaging/notes.ipa", "path",
                                         "com.example.notes", std::string("1.0"));
   auto recorded = client->_restoreStatePropertyForKey("path", "com.example.notes",
@@ -82,7 +110,7 @@ int runDemo(const std::string& root) {
   client->cleanRestoreStateForIdentifier("com.example.notes");
   std::printf("   restore state file left: %s\n", fileExists(paths.restoreState()) ? "yes" : "no");
 
-  std::printf("5. The daemon releases the client.\n");
+  std::printf("7. The daemon releases the client.\n");
   client.reset();
   std::printf("   registry observers: %zu\n\nlog file: %s/appsync.log\n",
               device.ar().observerCount(), root.c_str());
