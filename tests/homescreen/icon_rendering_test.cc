@@ -12,16 +12,14 @@
 #include "platform/fake/fake_platform.h"
 #include "platform/icon/png_codec.h"
 #include "support/temp_dir.h"
+#include "support/text_file.h"
 
 namespace appsync {
 namespace {
 
 namespace fs = std::filesystem;
 
-void writeText(const fs::path& path, std::string_view text) {
-  ASSERT_TRUE(writeFileAtomically(
-      path.string(), std::span(reinterpret_cast<const std::uint8_t*>(text.data()), text.size())));
-}
+using testing::writeText;
 
 // An application bundle whose Info.plist names one 180 x 180 icon of a single colour.
 std::string makeBundle(const fs::path& bundle) {

@@ -14,6 +14,7 @@
 #include "core/plist/codec.h"
 #include "platform/fake/fake_tr.h"
 #include "support/temp_dir.h"
+#include "support/text_file.h"
 
 namespace appsync {
 namespace {
@@ -36,10 +37,7 @@ class TodoListTest : public ::testing::Test {
   void write(const plist::Value& list, plist::Format format = plist::Format::Xml) {
     ASSERT_TRUE(writePlistAtomically(path, list, format));
   }
-  void writeRaw(std::string_view text) {
-    ASSERT_TRUE(writeFileAtomically(
-        path, std::span(reinterpret_cast<const std::uint8_t*>(text.data()), text.size())));
-  }
+  void writeRaw(std::string_view text) { testing::writeText(path, text); }
   plist::Bytes bytes() { return readFile(path).value_or(plist::Bytes{}); }
   plist::Array load() {
     auto value = plist::parse(bytes());

@@ -11,16 +11,14 @@
 #include "platform/icon/png_codec.h"
 #include "support/host_process.h"
 #include "support/temp_dir.h"
+#include "support/text_file.h"
 
 namespace appsync {
 namespace {
 
 namespace fs = std::filesystem;
 
-void writeText(const fs::path& path, std::string_view text) {
-  ASSERT_TRUE(writeFileAtomically(
-      path.string(), std::span(reinterpret_cast<const std::uint8_t*>(text.data()), text.size())));
-}
+using testing::writeText;
 
 // A bundle as a developer would lay it out: a name without ".png" whose file is the @2x variant.
 void makeBundle(const fs::path& bundle) {

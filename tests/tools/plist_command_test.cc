@@ -7,14 +7,12 @@
 #include "core/plist/codec.h"
 #include "support/host_process.h"
 #include "support/temp_dir.h"
+#include "support/text_file.h"
 
 namespace appsync {
 namespace {
 
-void writeText(const std::string& path, std::string_view text) {
-  ASSERT_TRUE(writeFileAtomically(
-      path, std::span(reinterpret_cast<const std::uint8_t*>(text.data()), text.size())));
-}
+using testing::writeText;
 
 TEST(PlistCommandTest, LintNamesTheBadFileAndThePlace) {
   const char* host = std::getenv("APPSYNC_HOST");

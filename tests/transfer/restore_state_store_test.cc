@@ -9,19 +9,14 @@
 #include "core/fs/files.h"
 #include "core/plist/codec.h"
 #include "support/temp_dir.h"
+#include "support/text_file.h"
 
 namespace appsync {
 namespace {
 
-std::string readText(const std::string& path) {
-  auto bytes = readFile(path);
-  return bytes ? std::string(bytes->begin(), bytes->end()) : std::string();
-}
+using testing::readText;
 
-void writeText(const std::string& path, std::string_view text) {
-  ASSERT_TRUE(writeFileAtomically(
-      path, std::span(reinterpret_cast<const std::uint8_t*>(text.data()), text.size())));
-}
+using testing::writeText;
 
 class RestoreStateStoreTest : public ::testing::Test {
  protected:

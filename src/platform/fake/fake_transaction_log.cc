@@ -25,22 +25,22 @@ std::vector<TransactionLogEntry> FakeTransactionLog::entries() const {
   return entries_;
 }
 
-std::vector<TransactionLogEntry> FakeTransactionLog::steps() const {
+std::vector<TransactionLogEntry> FakeTransactionLog::entriesOfKind(
+    TransactionLogEntry::Kind kind) const {
   std::lock_guard lock(mutex_);
   std::vector<TransactionLogEntry> out;
   for (const auto& e : entries_) {
-    if (e.kind == TransactionLogEntry::Kind::Step) out.push_back(e);
+    if (e.kind == kind) out.push_back(e);
   }
   return out;
 }
 
+std::vector<TransactionLogEntry> FakeTransactionLog::steps() const {
+  return entriesOfKind(TransactionLogEntry::Kind::Step);
+}
+
 std::vector<TransactionLogEntry> FakeTransactionLog::scenarios() const {
-  std::lock_guard lock(mutex_);
-  std::vector<TransactionLogEntry> out;
-  for (const auto& e : entries_) {
-    if (e.kind == TransactionLogEntry::Kind::Scenario) out.push_back(e);
-  }
-  return out;
+  return entriesOfKind(TransactionLogEntry::Kind::Scenario);
 }
 
 void FakeTransactionLog::clear() {

@@ -51,6 +51,7 @@ class FakeTransactionLog final : public AITransactionLog {
 
  private:
   void add(TransactionLogEntry entry);
+  std::vector<TransactionLogEntry> entriesOfKind(TransactionLogEntry::Kind kind) const;
 
   std::mutex listenerMutex_;  // taken before mutex_
   mutable std::mutex mutex_;
