@@ -4,7 +4,7 @@
 #include <cstdio>
 #include <string>
 
-#include "core/plist/codec.h"
+#include "runtime/plist/codec.h"
 
 namespace appsync::plist {
 namespace {

@@ -13,11 +13,11 @@
 #include <thread>
 #include <vector>
 
-#include "core/fs/files.h"
-#include "core/log/log.h"
-#include "core/plist/codec.h"
+#include "runtime/fs/files.h"
+#include "runtime/log/log.h"
+#include "runtime/plist/codec.h"
 #include "platform/fake/fake_tr.h"
-#include "sync/todo_list.h"
+#include "state/todo_list.h"
 
 namespace appsync {
 namespace {

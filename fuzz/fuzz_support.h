@@ -7,7 +7,7 @@
 
 #include <unistd.h>
 
-#include "core/fs/files.h"
+#include "runtime/fs/files.h"
 
 namespace appsync::fuzz {
 

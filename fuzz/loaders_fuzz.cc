@@ -12,12 +12,12 @@
 #include <string>
 #include <vector>
 
-#include "core/apps_client.h"
-#include "core/fs/files.h"
+#include "client/apps_client.h"
+#include "runtime/fs/files.h"
 #include "fuzz_support.h"
-#include "core/plist/codec.h"
+#include "runtime/plist/codec.h"
 #include "platform/fake/fake_tr.h"
-#include "sync/todo_list.h"
+#include "state/todo_list.h"
 
 namespace {
 

@@ -6,7 +6,7 @@
 #include <cstring>
 #include <vector>
 
-#include "core/plist/codec.h"
+#include "runtime/plist/codec.h"
 
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
   using namespace appsync::plist;

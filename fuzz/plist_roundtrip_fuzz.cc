@@ -8,7 +8,7 @@
 #include <cstdio>
 #include <cstdlib>
 
-#include "core/plist/codec.h"
+#include "runtime/plist/codec.h"
 
 namespace {
 

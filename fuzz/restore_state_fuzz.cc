@@ -12,10 +12,10 @@
 #include <optional>
 #include <string>
 
-#include "core/fs/files.h"
+#include "runtime/fs/files.h"
 #include "fuzz_support.h"
-#include "core/plist/codec.h"
-#include "transfer/restore_state_store.h"
+#include "runtime/plist/codec.h"
+#include "state/restore_state_store.h"
 
 namespace {
 

@@ -4,9 +4,9 @@
 #include <string>
 #include <vector>
 
-#include "core/apps_client.h"
-#include "core/fs/files.h"
-#include "core/plist/codec.h"
+#include "client/apps_client.h"
+#include "runtime/fs/files.h"
+#include "runtime/plist/codec.h"
 
 namespace appsync {
 
@@ -39,7 +39,7 @@ std::optional<plist::Array> fetchIconOrder(const Platform& platform, const LogCa
 }  // namespace
 
 plist::Array AppsClient::_orderTheItems(const Platform& platform, plist::Dict& items) {
-  const LogCategory& log = platform.tr.TRGetLogCategory(8);
+  const LogCategory& log = platform.tr.TRGetLogCategory(kAppSyncLogCategory);
   plist::Array result;
   result.reserve(items.size());
 

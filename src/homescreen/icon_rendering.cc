@@ -1,13 +1,13 @@
 // Rendering an installed bundle's home-screen icon to a PNG file, through the icon service.
-#include "core/apps_client.h"
-#include "core/fs/files.h"
+#include "client/apps_client.h"
+#include "runtime/fs/files.h"
 
 namespace appsync {
 
 bool AppsClient::_makeIconFromBundlePath(const Platform& platform,
                                          const std::optional<std::string>& bundlePath,
                                          const std::string& saveTo) {
-  const LogCategory& log = platform.tr.TRGetLogCategory(8);
+  const LogCategory& log = platform.tr.TRGetLogCategory(kAppSyncLogCategory);
   auto fail = [&log](std::string_view message) {
     pluginLog(log, LogLevel::Error, message);
     return false;

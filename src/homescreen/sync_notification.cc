@@ -1,6 +1,6 @@
 // Telling the home screen that a sync starts or is done, and handing it the host's icon layout.
-#include "core/apps_client.h"
-#include "core/fs/files.h"
+#include "client/apps_client.h"
+#include "runtime/fs/files.h"
 
 namespace appsync {
 
@@ -13,7 +13,7 @@ constexpr const char* kSyncNotification = "com.vantor.pavilion.trc.wsyncnotify";
 }  // namespace
 
 void AppsClient::_notifyPavilion(const Platform& platform, bool starting) {
-  const LogCategory& log = platform.tr.TRGetLogCategory(8);
+  const LogCategory& log = platform.tr.TRGetLogCategory(kAppSyncLogCategory);
   int token = 0;
   const std::uint32_t status = platform.system.notifyRegisterCheck(kSyncNotification, &token);
   pluginLog(log, LogLevel::Default, "%s|Notifying PV we are %s syncing",
@@ -35,7 +35,8 @@ void AppsClient::_sendIconLayoutToPavilion(const Platform& platform) {
   // The layout belongs to the home screen; it is passed on as bytes and never interpreted.
   std::optional<plist::Bytes> layout = readFile(platform.paths.iconLayout());
   if (!layout || layout->empty()) return;
-  pluginLog(platform.tr.TRGetLogCategory(8), LogLevel::Default, "%s|Sending iconlayout to PV");
+  pluginLog(platform.tr.TRGetLogCategory(kAppSyncLogCategory), LogLevel::Default,
+            "%s|Sending iconlayout to PV");
   const PVPort port = platform.pv.PVSPavilionBlockableServerPort();
   platform.pv.PVSetIconState(port, layout->data(), layout->size());
 }

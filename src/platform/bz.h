@@ -4,7 +4,7 @@
 #include <functional>
 #include <memory>
 
-#include "core/error.h"
+#include "runtime/error.h"
 
 namespace appsync {
 

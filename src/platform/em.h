@@ -8,7 +8,7 @@
 #include <string>
 #include <vector>
 
-#include "core/plist/value.h"
+#include "runtime/plist/value.h"
 
 namespace appsync {
 

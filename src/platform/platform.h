@@ -1,7 +1,7 @@
 // Every platform service the client calls, handed to it at construction. No globals.
 #pragma once
 
-#include "core/fs/paths.h"
+#include "runtime/fs/paths.h"
 #include "platform/ar.h"
 #include "platform/bz.h"
 #include "platform/em.h"

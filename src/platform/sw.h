@@ -5,7 +5,7 @@
 #include <memory>
 #include <string>
 
-#include "core/error.h"
+#include "runtime/error.h"
 
 namespace appsync {
 

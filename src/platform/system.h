@@ -6,9 +6,9 @@
 #include <optional>
 #include <string>
 
-#include "core/dispatch/clock.h"
-#include "core/error.h"
-#include "core/plist/value.h"
+#include "runtime/dispatch/clock.h"
+#include "runtime/error.h"
+#include "runtime/plist/value.h"
 
 namespace appsync {
 

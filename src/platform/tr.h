@@ -10,13 +10,19 @@
 #include <string>
 #include <string_view>
 
-#include "core/error.h"
-#include "core/log/log.h"
-#include "core/plist/value.h"
+#include "runtime/error.h"
+#include "runtime/log/log.h"
+#include "runtime/plist/value.h"
 
 namespace appsync {
 
 inline constexpr std::string_view kApplicationDataclass = "Application";
+
+// The log categories the plugin writes to: its own messages, the few summaries that go to the
+// host's sync category, and the category of the account type check.
+inline constexpr int kAppSyncLogCategory = 8;
+inline constexpr int kSyncSummaryLogCategory = 14;
+inline constexpr int kTypeCheckLogCategory = 0;
 
 // Asset-part codes of a transfer.
 inline constexpr std::uint64_t kTRAssetPartApplication = 1;

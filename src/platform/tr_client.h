@@ -13,8 +13,8 @@
 #include <string_view>
 #include <vector>
 
-#include "core/error.h"
-#include "core/plist/value.h"
+#include "runtime/error.h"
+#include "runtime/plist/value.h"
 #include "platform/sw.h"
 #include "platform/tr.h"
 

@@ -3,8 +3,8 @@
 
 #include <cerrno>
 
-#include "core/log/log.h"
 #include "platform/bundle_keys.h"
+#include "runtime/log/log.h"
 
 namespace appsync {
 
@@ -50,7 +50,7 @@ void reportPlaceholderDirectory(const Platform& platform, const std::string& bun
     platform.transactionLog.logScenario(std::string(kCaravelAppRestoreScenario), 0, false, bundleID,
                                         "Failed to create app directory");
   }
-  pluginLog(platform.tr.TRGetLogCategory(8), LogLevel::Default,
+  pluginLog(platform.tr.TRGetLogCategory(kAppSyncLogCategory), LogLevel::Default,
             "%s|Created app directory for '%{public}@' at %{public}@ with err=%{public}@", bundleID,
             path, error);
 }

@@ -7,8 +7,8 @@
 #include <string>
 #include <string_view>
 
-#include "core/error.h"
-#include "core/plist/value.h"
+#include "runtime/error.h"
+#include "runtime/plist/value.h"
 #include "platform/platform.h"
 
 namespace appsync {

@@ -1,6 +1,6 @@
 // Which placeholder applications the registry holds: one application's, all of them, and the
 // system applications that are still placeholders.
-#include "core/apps_client.h"
+#include "client/apps_client.h"
 
 namespace appsync {
 

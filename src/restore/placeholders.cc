@@ -3,9 +3,9 @@
 #include <cerrno>
 #include <vector>
 
-#include "core/apps_client.h"
-#include "core/fs/files.h"
-#include "core/fs/paths.h"
+#include "client/apps_client.h"
+#include "runtime/fs/files.h"
+#include "runtime/fs/paths.h"
 #include "restore/placeholder_info.h"
 
 namespace appsync {

@@ -1,8 +1,8 @@
 // The restore road for one application of the restore list: a placeholder directory built from
 // the application's store metadata, icon and SINF, installed through the registry.
-#include "core/apps_client.h"
-#include "core/fs/files.h"
-#include "core/plist/codec.h"
+#include "client/apps_client.h"
+#include "runtime/fs/files.h"
+#include "runtime/plist/codec.h"
 #include "platform/bundle_keys.h"
 #include "restore/placeholder_info.h"
 

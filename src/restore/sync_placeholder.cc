@@ -1,8 +1,8 @@
 // The sync road: a placeholder for an application the host has announced, so that its icon and
 // name are on the home screen while the package is on its way.
-#include "core/apps_client.h"
-#include "core/fs/files.h"
-#include "core/plist/codec.h"
+#include "client/apps_client.h"
+#include "runtime/fs/files.h"
+#include "runtime/plist/codec.h"
 #include "platform/bundle_keys.h"
 #include "restore/placeholder_info.h"
 

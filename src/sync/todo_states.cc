@@ -1,6 +1,6 @@
 // The client's todo-state changes: every transfer, install and coordination step records its
 // outcome in the host's todo list through here.
-#include "core/apps_client.h"
+#include "client/apps_client.h"
 
 namespace appsync {
 

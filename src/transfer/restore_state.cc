@@ -1,5 +1,5 @@
 // The client's access to the restore state store.
-#include "core/apps_client.h"
+#include "client/apps_client.h"
 
 namespace appsync {
 

@@ -5,9 +5,9 @@
 #include <string>
 #include <vector>
 
-#include "core/apps_client.h"
-#include "core/fs/files.h"
-#include "core/plist/codec.h"
+#include "client/apps_client.h"
+#include "runtime/fs/files.h"
+#include "runtime/plist/codec.h"
 #include "platform/fake/fake_platform.h"
 #include "support/temp_dir.h"
 

@@ -5,8 +5,8 @@
 #include <string>
 #include <vector>
 
-#include "core/apps_client.h"
-#include "core/fs/files.h"
+#include "client/apps_client.h"
+#include "runtime/fs/files.h"
 #include "platform/fake/fake_platform.h"
 #include "support/temp_dir.h"
 

@@ -9,7 +9,7 @@
 #include <string>
 #include <string_view>
 
-#include "core/fs/files.h"
+#include "runtime/fs/files.h"
 
 namespace appsync::testing {
 

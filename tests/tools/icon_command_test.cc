@@ -7,7 +7,7 @@
 #include <filesystem>
 #include <string>
 
-#include "core/fs/files.h"
+#include "runtime/fs/files.h"
 #include "platform/icon/png_codec.h"
 #include "support/host_process.h"
 #include "support/temp_dir.h"

@@ -3,8 +3,8 @@
 
 #include <string>
 
-#include "core/fs/files.h"
-#include "core/plist/codec.h"
+#include "runtime/fs/files.h"
+#include "runtime/plist/codec.h"
 #include "support/host_process.h"
 #include "support/temp_dir.h"
 #include "support/text_file.h"

@@ -4,7 +4,7 @@
 #include <string>
 
 #include "commands.h"
-#include "core/fs/files.h"
+#include "runtime/fs/files.h"
 #include "platform/icon/home_screen_icon_service.h"
 
 namespace appsync::host {

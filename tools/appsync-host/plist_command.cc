@@ -4,8 +4,8 @@
 #include <vector>
 
 #include "commands.h"
-#include "core/fs/files.h"
-#include "core/plist/codec.h"
+#include "runtime/fs/files.h"
+#include "runtime/plist/codec.h"
 
 namespace appsync::host {
 

@@ -5,9 +5,9 @@
 #include <algorithm>
 #include <system_error>
 
-#include "core/fs/files.h"
-#include "core/fs/paths.h"
-#include "core/plist/codec.h"
+#include "runtime/fs/files.h"
+#include "runtime/fs/paths.h"
+#include "runtime/plist/codec.h"
 #include "platform/bundle_keys.h"
 
 namespace appsync {

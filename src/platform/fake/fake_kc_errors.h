@@ -4,7 +4,7 @@
 #include <cstdint>
 #include <string_view>
 
-#include "core/error.h"
+#include "runtime/error.h"
 
 namespace appsync {
 

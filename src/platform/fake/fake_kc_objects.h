@@ -21,8 +21,8 @@
 #include <string_view>
 #include <vector>
 
-#include "core/error.h"
-#include "core/plist/value.h"
+#include "runtime/error.h"
+#include "runtime/plist/value.h"
 #include "platform/em.h"
 #include "platform/kc.h"
 

@@ -6,8 +6,8 @@
 #include <memory>
 #include <string>
 
-#include "core/dispatch/clock.h"
-#include "core/fs/paths.h"
+#include "runtime/dispatch/clock.h"
+#include "runtime/fs/paths.h"
 #include "platform/fake/fake_ar.h"
 #include "platform/fake/fake_bz.h"
 #include "platform/fake/fake_em.h"

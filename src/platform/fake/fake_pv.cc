@@ -3,7 +3,7 @@
 
 #include <cstring>
 
-#include "core/plist/codec.h"
+#include "runtime/plist/codec.h"
 
 namespace appsync {
 

@@ -13,7 +13,7 @@
 #include <string>
 #include <vector>
 
-#include "core/plist/value.h"
+#include "runtime/plist/value.h"
 #include "platform/fake/fake_service.h"
 #include "platform/pv.h"
 

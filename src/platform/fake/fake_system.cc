@@ -11,7 +11,7 @@
 #include <cerrno>
 #include <vector>
 
-#include "core/fs/files.h"
+#include "runtime/fs/files.h"
 
 namespace appsync {
 

@@ -9,7 +9,7 @@
 #include <string>
 #include <vector>
 
-#include "core/log/log.h"
+#include "runtime/log/log.h"
 #include "platform/fake/callback_thread.h"
 #include "platform/fake/fake_service.h"
 #include "platform/tr.h"

@@ -7,7 +7,7 @@
 #include <fstream>
 #include <span>
 
-#include "core/plist/codec.h"
+#include "runtime/plist/codec.h"
 #include "platform/icon/png_codec.h"
 
 namespace appsync::icon {

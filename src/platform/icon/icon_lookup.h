@@ -7,7 +7,7 @@
 #include <string>
 #include <vector>
 
-#include "core/plist/value.h"
+#include "runtime/plist/value.h"
 #include "platform/icon/image.h"
 
 namespace appsync::icon {

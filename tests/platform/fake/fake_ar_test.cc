@@ -11,8 +11,8 @@
 #include <mutex>
 #include <thread>
 
-#include "core/fs/files.h"
-#include "core/plist/codec.h"
+#include "runtime/fs/files.h"
+#include "runtime/plist/codec.h"
 #include "support/temp_dir.h"
 
 namespace appsync {

@@ -4,7 +4,7 @@
 
 #include <gtest/gtest.h>
 
-#include "core/plist/codec.h"
+#include "runtime/plist/codec.h"
 
 namespace appsync {
 namespace {

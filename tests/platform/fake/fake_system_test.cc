@@ -10,8 +10,8 @@
 #include <future>
 #include <thread>
 
-#include "core/dispatch/clock.h"
-#include "core/fs/files.h"
+#include "runtime/dispatch/clock.h"
+#include "runtime/fs/files.h"
 #include "support/temp_dir.h"
 
 namespace appsync {

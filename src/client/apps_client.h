@@ -1,0 +1,205 @@
+// AppsClient: the plugin's one long-lived object. The host creates it and calls it through the
+// client protocol for the dataclass "Application"; the platform calls it back as a registry
+// observer and as the install-coordination delegate. Its operations are implemented in the
+// file of the concern they belong to; this header is the map.
+#pragma once
+
+#include <atomic>
+#include <cstdint>
+#include <functional>
+#include <memory>
+#include <mutex>
+#include <optional>
+#include <set>
+#include <string>
+#include <string_view>
+#include <vector>
+
+#include "platform/platform.h"
+#include "platform/tr_client.h"
+#include "runtime/dispatch/group.h"
+#include "runtime/dispatch/operation_queue.h"
+#include "runtime/dispatch/serial_queue.h"
+#include "runtime/log/log.h"
+#include "state/loaders.h"
+#include "state/restore_state_store.h"
+#include "state/todo_list.h"
+
+namespace appsync {
+
+// The host daemon's main bundle identifier: inside it the client listens for start-up.
+inline constexpr std::string_view kHostDaemonBundleIdentifier = "com.vantor.trc";
+inline constexpr std::string_view kHostStartupNotification =
+    "com.vantor.trc.TRStartupCompleteNotification";
+inline constexpr std::string_view kInstallObserverServiceName =
+    "com.vantor.trc.zpc.icappobserverdelegate";
+inline constexpr std::string_view kAccessQueueLabel = "com.vantor.kel.Trellis.AppSync";
+inline constexpr std::string_view kRestoreQueueLabel = "com.vantor.kel.Trellis.AppRestore";
+inline constexpr std::size_t kMaxConcurrentInstalls = 10;
+
+class AppsClient : public TRClient,
+                   public ARApplicationWorkspaceObserverProtocol,
+                   public KCAppInstallObserverDelegate {
+ public:
+  // Builds every field, registers with the registry, initialises the transaction log, chooses
+  // the installation road and, inside the host daemon, listens for its start-up notification.
+  explicit AppsClient(const Platform& platform);
+  // Logs unfinished work, unregisters, then waits for install operations still queued or
+  // running so that none outlives the client.
+  ~AppsClient() override;
+  AppsClient(const AppsClient&) = delete;
+  AppsClient& operator=(const AppsClient&) = delete;
+
+  // ---- Client protocol ------------------------------------------------------------------------
+  std::vector<std::string> supportedDataclasses() override;
+  bool respondsTo(TRClientOperation operation) const override;
+
+  // ---- Start-up ------------------------------------------------------------------------------
+  // The notification-center callback for the host's start-up notification; `observer` is the
+  // client. Does nothing when it is absent.
+  static void _handleTRCStartupCompletedNotification(void* center, void* observer,
+                                                     const std::string& name, const void* object,
+                                                     const plist::Dict* userInfo);
+  // Creates the install-coordination observer, at most once.
+  void setupInstallCoordinatorObserver();
+
+  // ---- Accessors used across the client -------------------------------------------------------
+  std::uint32_t _getAndResetNumAppInstallsAttempted();
+  // Counts one call of the registry's install operation (relaxed atomic add).
+  void _countAppInstallAttempt() {
+    _numAppInstallsAttempted.fetch_add(1, std::memory_order_relaxed);
+  }
+  bool _appInstallationAllowed();
+  bool _appRemovalAllowed();
+
+  // ---- Property-list loaders ---------------------------------------------------------------
+  // The todo list (or the last-sync list) at `path`: its root array, or absent when the file is
+  // missing, empty, not a property list or not an array. *error receives a read or parse error.
+  static std::optional<plist::Array> _loadPlist(TRHostFramework& tr, const std::string& path,
+                                                ErrorRef* error) {
+    return loadTodoList(tr, path, error);
+  }
+  // The demoted-applications list at `path`: its root dictionary, or absent likewise.
+  static std::optional<plist::Dict> _loadDemotedAppsPlist(TRHostFramework& tr,
+                                                          const std::string& path,
+                                                          ErrorRef* error) {
+    return loadDemotedAppsList(tr, path, error);
+  }
+
+  // ---- Todo states (sync/todo_states.cc) -----------------------------------------------------
+  // Records `toDo` as the "operation" of the first todo record of `assetID`. Any thread.
+  void changeAssetID(const std::string& assetID, const std::string& toDo);
+
+  // ---- Restore state store (transfer/restore_state.cc) ---------------------------------------
+  std::optional<plist::Value> _restoreStatePropertyForKey(
+      const std::string& key, const std::string& identifier,
+      const std::optional<std::string>& version);
+  void _setRestoreStatePropertyValue(const plist::Value& value, const std::string& forKey,
+                                     const std::string& identifier,
+                                     const std::optional<std::string>& version);
+  void cleanRestoreStateForIdentifier(const std::string& identifier);
+
+  // ---- Home screen (homescreen/) -------------------------------------------------------------
+  // Tells the home screen that a sync starts (true) or is done (false).
+  static void _notifyPavilion(const Platform& platform, bool starting);
+  // Hands the icon layout of the sync folder to the home screen, unless it is missing or empty.
+  static void _sendIconLayoutToPavilion(const Platform& platform);
+  // Orders candidate records (identifier -> record) by the home screen's icon order; items
+  // placed by that order are removed from `items`, the others follow in identifier order.
+  static plist::Array _orderTheItems(const Platform& platform, plist::Dict& items);
+  // Renders the bundle's home-screen icon to a PNG file at `saveTo`. True when it was written.
+  static bool _makeIconFromBundlePath(const Platform& platform,
+                                      const std::optional<std::string>& bundlePath,
+                                      const std::string& saveTo);
+
+  // ---- Restore placeholders (restore/placeholders*.cc) ----------------------------------------
+  // TEMP/com.vantor.trc.Apps/ID.app; absent for an identifier that would leave that directory.
+  std::optional<std::string> placeholderAppPathForBundleIdentifier(const std::string& bundleID);
+  bool createPlaceHolderPath(const std::string& path, const std::string& forBundleIdentifier,
+                             const FileAttributes& withAttributes);
+  bool writeIconData(const std::optional<plist::Bytes>& iconData, const std::string& atPath,
+                     std::uint64_t* returningFileSize, const std::string& forBundleIdentifier,
+                     const FileAttributes& withAttributes);
+  // The restore road for one application of the restore list.
+  bool _processCaravelRestoreInfoForApp(const std::string& bundleID,
+                                        const plist::Bytes& caravelMetaData,
+                                        const std::optional<plist::Bytes>& sinfData,
+                                        const std::optional<plist::Bytes>& iconData);
+  // The sync road: a placeholder for an asset the host is about to send.
+  void _createPlaceHolderApplication(const std::shared_ptr<TRAsset>& asset);
+
+  // ---- Placeholder lookup (restore/placeholder_lookup.cc) -------------------------------------
+  using ProxyBlock =
+      std::function<void(const std::shared_ptr<const ARApplicationProxy>& proxy, bool* stop)>;
+  bool _placeholderExistsForApplication(const std::string& bundleID);
+  void _enumeratePlaceholdersWithBlock(const ProxyBlock& block);
+  std::set<std::string> _getSystemAppPlaceholders();
+
+  // ---- Facts for tests and the simulator -----------------------------------------------------
+  bool useInstallCoordinator() const { return _useInstallCoordinator; }
+  bool hasInstallCoordinatorObserver() const;
+  bool finishedWaitingForPlaceHolderInstalls();
+  std::string describe() const;
+
+ private:
+  // Messages of the client. Category 8 unless named; the "%s|" prefix is filled in.
+  template <typename... Args>
+  void logDefault(std::string_view format, const Args&... args) const {
+    pluginLog(platform_.tr.TRGetLogCategory(kAppSyncLogCategory), LogLevel::Default, format,
+              args...);
+  }
+  template <typename... Args>
+  void logError(std::string_view format, const Args&... args) const {
+    pluginLog(platform_.tr.TRGetLogCategory(kAppSyncLogCategory), LogLevel::Error, format, args...);
+  }
+
+  const Platform platform_;
+
+  // Fields. "Writer" names who may change a field after construction.
+
+  // Identifiers the installer reported as uninstalled. Writer: installedAssets (replace),
+  // syncEndedWithSuccess (clear). No guard.
+  std::optional<std::vector<std::string>> _uninstalledApps;
+  // One member per legacy install in flight. Writer: the install queue (enter, leave).
+  std::unique_ptr<Group> _installGroup;
+  // One member per restoring app whose placeholder is awaited. Enter/leave on _restoreQueue.
+  std::unique_ptr<Group> _restorePlaceHoldersWaitGroup;
+  // Installs attempted since the last read. Atomic add by the install queue; exchanged with 0
+  // by _getAndResetNumAppInstallsAttempted.
+  std::atomic<std::uint32_t> _numAppInstallsAttempted{0};
+  // Assets whose transfer reported progress and has not ended. Writer: transfer completion.
+  std::set<std::string> _outstandingPFTTransfers;
+  // Runs the legacy install operations, at most kMaxConcurrentInstalls at once.
+  std::unique_ptr<OperationQueue> _installOperationQueue;
+  // The backup service's manager, kept for the client's lifetime.
+  std::shared_ptr<SWManager> _backupManager;
+  // Apps whose transfer updates an installed app. Guard: _accessQueue. Writers: outstanding
+  // transfers (add), transfer completion (remove, empty).
+  std::set<std::string> _updatingApps;
+  // Apps whose install the user cancelled. Guard: _accessQueue. Writers: coordinator events
+  // (add), transfer completion (remove, empty).
+  std::set<std::string> _userCancelledApps;
+  // Restoring apps whose placeholder install is awaited. Guard: _restoreQueue.
+  std::set<std::string> _placeholdersForRestoringApps;
+  // The installation road, fixed at construction: coordinated (true) or legacy (false).
+  bool _useInstallCoordinator = false;
+  // True once nobody waits for placeholder installs. Guard: _restoreQueue.
+  bool _finishedWaitingForPlaceHolderInstalls = false;
+  std::unique_ptr<SerialQueue> _accessQueue;
+  std::unique_ptr<SerialQueue> _restoreQueue;
+  // Delivers coordinator events. Writer: setupInstallCoordinatorObserver, teardown.
+  std::shared_ptr<KCAppInstallObserver> _appInstallObserver;
+  // Members of _restorePlaceHoldersWaitGroup. Changed on _restoreQueue.
+  std::int64_t _restoringPlaceholderCount = 0;
+
+  // The todo list's writer and the restore state store, each with its own lock.
+  TodoList todoList_;
+  RestoreStateStore restoreStateStore_;
+
+  // Makes the at-most-once creation of the coordination observer safe when start-up
+  // notifications race.
+  mutable std::mutex observerMutex_;
+  bool insideHostDaemon_ = false;
+};
+
+}  // namespace appsync

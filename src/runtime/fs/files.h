@@ -1,0 +1,52 @@
+// File operations of the plugin: whole-file reads, atomic whole-file writes, directories.
+// Failures come back as POSIX errors naming the path; nothing throws.
+#pragma once
+
+#include <cstdint>
+#include <optional>
+#include <span>
+#include <string>
+#include <string_view>
+
+#include "runtime/error.h"
+#include "runtime/plist/codec.h"
+#include "runtime/plist/value.h"
+
+namespace appsync {
+
+// Reads a whole file, without caching. Absent (and *error set) when it cannot be read, or when
+// it is larger than the property-list size bound.
+std::optional<plist::Bytes> readFile(const std::string& path, ErrorRef* error = nullptr);
+
+// Replaces `path` with `bytes` so that any reader, and any crash of this process, sees either the
+// old file or the new one: a temporary file in the same directory is written completely, then
+// renamed over the target. It is not synced to the disk; the guarantee covers crashes of the
+// process, not of the machine. The new file keeps the old one's permission bits (0644 for a new
+// file). On failure the old file is left as it was and the temporary file is removed. A process
+// killed in the middle may leave its temporary file (".NAME.XXXXXX") behind.
+bool writeFileAtomically(const std::string& path, std::span<const std::uint8_t> bytes,
+                         ErrorRef* error = nullptr);
+
+// Serialises `value` in `format` and writes it atomically. A value the format cannot carry is
+// an error of kPropertyListErrorDomain with the codec's message and the path.
+bool writePlistAtomically(const std::string& path, const plist::Value& value, plist::Format format,
+                          ErrorRef* error = nullptr);
+
+bool fileExists(const std::string& path);
+bool directoryExists(const std::string& path);
+
+// mkdir -p. True when the directory exists afterwards.
+bool createDirectories(const std::string& path, ErrorRef* error = nullptr);
+// mkdir of the last component only (parents must exist). True when it was created.
+bool createDirectory(const std::string& path, ErrorRef* error = nullptr);
+// rm -rf. True when nothing is left at the path.
+bool removeAll(const std::string& path, ErrorRef* error = nullptr);
+// Removes one file. True when it was removed.
+bool removeFile(const std::string& path, ErrorRef* error = nullptr);
+// rename(2); fails when the destination exists and is a non-empty directory.
+bool moveItem(const std::string& from, const std::string& to, ErrorRef* error = nullptr);
+// Copies one regular file; fails when the destination exists.
+bool copyFile(const std::string& from, const std::string& to, ErrorRef* error = nullptr);
+std::optional<std::uint64_t> fileSize(const std::string& path, ErrorRef* error = nullptr);
+
+}  // namespace appsync

@@ -1,0 +1,69 @@
+// The message formatter: every specifier the plugin uses, with present, absent, missing and
+// mismatched arguments.
+#include <gtest/gtest.h>
+
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "runtime/log/log.h"
+
+namespace appsync {
+namespace {
+
+struct Thing {
+  std::string describe() const { return "<Thing 7>"; }
+};
+
+struct FormatCase {
+  std::string format;
+  std::vector<LogArg> args;
+  std::string expected;
+};
+
+TEST(FormatLogMessageTest, EverySpecifier) {
+  const char* noText = nullptr;
+  std::optional<std::string> noString;
+  std::shared_ptr<Thing> noThing;
+  const std::vector<FormatCase> cases = {
+      {"plain text", {}, "plain text"},
+      {"%s|hello", {kPluginBundleIdentifier}, "com.vantor.trc.AppSync|hello"},
+      {"%s", {noText}, "(null)"},
+      {"%s", {std::string("std")}, "std"},
+      {"%d %i", {-42, 7}, "-42 7"},
+      {"%u %zu", {42u, std::size_t{9}}, "42 9"},
+      {"%ld %lu", {-5L, 5UL}, "-5 5"},
+      {"%lld %llu", {INT64_MIN, UINT64_MAX}, "-9223372036854775808 18446744073709551615"},
+      {"existingApp:%d", {true}, "existingApp:1"},
+      {"%f|%lf", {0.5, 2.0f}, "0.500000|2.000000"},
+      {"%f", {1e20}, "100000000000000000000.000000"},
+      {"success: %c", {'y'}, "success: y"},
+      {"%@", {std::string("an object")}, "an object"},
+      {"%{public}@ / %@", {Thing{}, std::make_shared<Thing>()}, "<Thing 7> / <Thing 7>"},
+      {"%{public}@", {plist::Value(plist::Array{})}, plist::Value(plist::Array{}).describe()},
+      {"secret %{private}@!", {std::string("password")}, "secret <private>!"},
+      {"%{public}@pending", {std::string("[]")}, "[]pending"},
+      {"100%% done", {}, "100% done"},
+      // Absent values of every kind print "(null)", as do arguments that were never passed.
+      {"%@ %{public}@ %d %f",
+       {LogArg(), noString, noThing, nullptr},
+       "(null) (null) (null) (null)"},
+      {"%s and %d and %@", {std::string("one")}, "one and (null) and (null)"},
+      // A mismatch prints the argument as what it is.
+      {"%d", {std::string("text")}, "text"},
+      {"%@ %s", {12, 3.5}, "12 3.500000"},
+      {"%d|%u|%c", {'a', -1, 200000}, "97|-1|200000"},
+      {"%f %c", {3, 65}, "3.000000 A"},
+      {"%u", {UINT64_MAX}, "18446744073709551615"},
+      // Specifiers we do not know are copied and consume nothing.
+      {"%x %5d %{public}s %ls %d", {8}, "%x %5d %{public}s %ls 8"},
+      {"trailing %", {}, "trailing %"},
+      {"%d extra", {1, 2, 3}, "1 extra"},
+  };
+  for (const FormatCase& c : cases) {
+    EXPECT_EQ(formatLogMessage(c.format, c.args), c.expected) << "format: " << c.format;
+  }
+}
+
+}  // namespace
+}  // namespace appsync

@@ -1,0 +1,370 @@
+// The property-list codec on well-formed input: every type in both formats, exact XML text,
+// round trips, integer and real forms, Unicode, depth limits and what the writers refuse.
+#include "runtime/plist/codec.h"
+
+#include <gtest/gtest.h>
+
+#include <algorithm>
+#include <cmath>
+#include <limits>
+#include <memory>
+#include <string>
+
+#include "runtime/plist/plist_test_util.h"
+
+namespace appsync::plist {
+namespace {
+
+using testing::BplistBuilder;
+using testing::everyType;
+using testing::everyTypeAsXmlReadsIt;
+
+std::span<const std::uint8_t> bytesOf(std::string_view s) {
+  return {reinterpret_cast<const std::uint8_t*>(s.data()), s.size()};
+}
+
+std::optional<Value> parseText(std::string_view s, ParseError* error = nullptr) {
+  return parse(bytesOf(s), error);
+}
+
+std::string plistXml(std::string_view body) {
+  return std::string("<?xml version=\"1.0\" encoding=\"UTF-8\"?>\n<plist version=\"1.0\">\n") +
+         std::string(body) + "\n</plist>\n";
+}
+
+Value nested(std::size_t depth) {
+  Value v = Array{};
+  for (std::size_t i = 1; i < depth; ++i) v = Array{std::move(v)};
+  return v;
+}
+
+bool contains(const Bytes& haystack, std::initializer_list<std::uint8_t> needle) {
+  return std::search(haystack.begin(), haystack.end(), needle.begin(), needle.end()) !=
+         haystack.end();
+}
+
+TEST(CodecTest, EveryTypeSurvivesBothFormats) {
+  Format format;
+  std::optional<Bytes> binary = writeBinary(everyType());
+  ASSERT_TRUE(binary);
+  EXPECT_EQ(parse(*binary, nullptr, &format), everyType());
+  EXPECT_EQ(format, Format::Binary);
+
+  std::optional<std::string> xml = writeXml(everyType());
+  ASSERT_TRUE(xml);
+  ParseError error;
+  EXPECT_EQ(parse(bytesOf(*xml), &error, &format), everyTypeAsXmlReadsIt()) << error.message;
+  EXPECT_EQ(format, Format::Xml);
+
+  // write() picks the format.
+  EXPECT_EQ(write(everyType(), Format::Binary), binary);
+  EXPECT_EQ(write(everyType(), Format::Xml), Bytes(xml->begin(), xml->end()));
+}
+
+TEST(CodecTest, XmlTextIsExact) {
+  Bytes blob;
+  for (int i = 0; i < 60; ++i) blob.push_back(static_cast<std::uint8_t>(i));
+  Value value = Dict{
+      {"name", "a & b <c>\r\n\t\u00e9"},
+      {"count", -7},
+      {"big", std::numeric_limits<std::uint64_t>::max()},
+      {"ratio", 0.1},
+      {"huge", 1e100},
+      {"odd", Array{std::nan(""), -std::numeric_limits<double>::infinity(), 2.0}},
+      {"when", Date{730902896.75}},
+      {"blob", blob},
+      {"none", Bytes{}},
+      {"ref", Uid{3}},
+      {"list", Array{true, false, Array{}, Dict{}}},
+  };
+  const std::string expected =
+      "<?xml version=\"1.0\" encoding=\"UTF-8\"?>\n"
+      "<plist version=\"1.0\">\n"
+      "<dict>\n"
+      "\t<key>name</key>\n"
+      "\t<string>a &amp; b &lt;c&gt;&#13;\n\t\u00e9</string>\n"
+      "\t<key>count</key>\n"
+      "\t<integer>-7</integer>\n"
+      "\t<key>big</key>\n"
+      "\t<integer>18446744073709551615</integer>\n"
+      "\t<key>ratio</key>\n"
+      "\t<real>0.1</real>\n"
+      "\t<key>huge</key>\n"
+      "\t<real>1e+100</real>\n"
+      "\t<key>odd</key>\n"
+      "\t<array>\n"
+      "\t\t<real>nan</real>\n"
+      "\t\t<real>-inf</real>\n"
+      "\t\t<real>2</real>\n"
+      "\t</array>\n"
+      "\t<key>when</key>\n"
+      "\t<date>2024-02-29T12:34:56Z</date>\n"
+      "\t<key>blob</key>\n"
+      "\t<data>\n"
+      "\tAAECAwQFBgcICQoLDA0ODxAREhMUFRYXGBkaGxwdHh8gISIjJCUmJygpKissLS4vMDEyMzQ1Njc4\n"
+      "\tOTo7\n"
+      "\t</data>\n"
+      "\t<key>none</key>\n"
+      "\t<data></data>\n"
+      "\t<key>ref</key>\n"
+      "\t<dict>\n"
+      "\t\t<key>CF$UID</key>\n"
+      "\t\t<integer>3</integer>\n"
+      "\t</dict>\n"
+      "\t<key>list</key>\n"
+      "\t<array>\n"
+      "\t\t<true/>\n"
+      "\t\t<false/>\n"
+      "\t\t<array/>\n"
+      "\t\t<dict/>\n"
+      "\t</array>\n"
+      "</dict>\n"
+      "</plist>\n";
+  EXPECT_EQ(writeXml(value), expected);
+
+  // Reading it back: the CR survives, the date keeps whole seconds, NaN stays NaN.
+  std::optional<Value> back = parseText(expected);
+  ASSERT_TRUE(back);
+  const Dict& d = *back->dict();
+  EXPECT_EQ(*stringAt(d, "name"), "a & b <c>\r\n\t\u00e9");
+  EXPECT_EQ(d.find("when")->date()->secondsSince2001, 730902896);
+  EXPECT_TRUE(std::isnan(*(*arrayAt(d, "odd"))[0].real()));
+  EXPECT_EQ(*d.find("blob"), Value(blob));
+  EXPECT_EQ(*d.find("ref"), Value(Dict{{"CF$UID", 3}}));
+}
+
+TEST(CodecTest, RoundTripsAreByteAndValueIdentical) {
+  const std::string xml = *writeXml(everyTypeAsXmlReadsIt());
+  std::optional<Value> fromXml = parseText(xml);
+  ASSERT_TRUE(fromXml);
+  std::optional<Bytes> binary = writeBinary(*fromXml);
+  ASSERT_TRUE(binary);
+  std::optional<Value> fromBinary = parse(*binary);
+  ASSERT_TRUE(fromBinary);
+  EXPECT_EQ(*fromBinary, *fromXml);
+  EXPECT_EQ(writeXml(*fromBinary), xml);
+  EXPECT_EQ(writeBinary(*fromBinary), binary);
+
+  // Key order is the file's, not sorted, and survives both formats beyond 16 keys.
+  Dict many;
+  for (int i = 0; i < 50; ++i) many.set("key" + std::to_string((i * 31) % 50), i);
+  EXPECT_EQ(parse(*writeBinary(many)), Value(many));
+  EXPECT_EQ(parseText(*writeXml(many)), Value(many));
+}
+
+TEST(CodecTest, IntegerForms) {
+  struct Case {
+    const char* text;
+    Integer expected;
+    std::initializer_list<std::uint8_t> binary;  // how the binary writer encodes it
+  };
+  const Case cases[] = {
+      {"0", Integer::fromSigned(0), {0x10, 0x00}},
+      {"+255", Integer::fromSigned(255), {0x10, 0xFF}},
+      {"256", Integer::fromSigned(256), {0x11, 0x01, 0x00}},
+      {" 0x10000 ", Integer::fromSigned(65536), {0x12, 0x00, 0x01, 0x00, 0x00}},
+      {"0XffffFFFF", Integer::fromSigned(0xFFFFFFFF), {0x12, 0xFF, 0xFF, 0xFF, 0xFF}},
+      {"4294967296", Integer::fromSigned(1ll << 32), {0x13, 0, 0, 0, 1, 0, 0, 0, 0}},
+      {"-1", Integer::fromSigned(-1), {0x13, 0xFF, 0xFF, 0xFF, 0xFF, 0xFF, 0xFF, 0xFF, 0xFF}},
+      {"-0x10", Integer::fromSigned(-16), {0x13, 0xFF, 0xFF, 0xFF, 0xFF, 0xFF, 0xFF, 0xFF, 0xF0}},
+      {"-0", Integer::fromSigned(0), {0x10, 0x00}},
+      {"-9223372036854775808",
+       Integer::fromSigned(std::numeric_limits<std::int64_t>::min()),
+       {0x13, 0x80, 0, 0, 0, 0, 0, 0, 0}},
+      {"9223372036854775807",
+       Integer::fromSigned(std::numeric_limits<std::int64_t>::max()),
+       {0x13, 0x7F, 0xFF, 0xFF, 0xFF, 0xFF, 0xFF, 0xFF, 0xFF}},
+      {"9223372036854775808",
+       Integer::fromUnsigned(1ull << 63),
+       {0x14, 0, 0, 0, 0, 0, 0, 0, 0, 0x80, 0, 0, 0, 0, 0, 0, 0}},
+      {"18446744073709551615",
+       Integer::fromUnsigned(~0ull),
+       {0x14, 0, 0, 0, 0, 0, 0, 0, 0, 0xFF, 0xFF, 0xFF, 0xFF, 0xFF, 0xFF, 0xFF, 0xFF}},
+      {"0xFFFFFFFFFFFFFFFF", Integer::fromUnsigned(~0ull), {0x14}},
+  };
+  for (const Case& c : cases) {
+    SCOPED_TRACE(c.text);
+    ParseError error;
+    std::optional<Value> v =
+        parseText(plistXml(std::string("<integer>") + c.text + "</integer>"), &error);
+    ASSERT_TRUE(v) << error.message;
+    EXPECT_EQ(*v->integer(), c.expected);
+    std::optional<Bytes> binary = writeBinary(*v);
+    ASSERT_TRUE(binary);
+    EXPECT_EQ(Bytes(binary->begin() + 8, binary->begin() + 8 + c.binary.size()), Bytes(c.binary));
+    EXPECT_EQ(parse(*binary), v);
+  }
+
+  // The platform's other encodings: 1/2/4-byte integers are unsigned, and a 16-byte integer
+  // may carry a negative 64-bit value.
+  BplistBuilder b;
+  b.objects = {{0xA3, 1, 2, 3},
+               {0x12, 0xFF, 0xFF, 0xFF, 0xFE},
+               {0x14, 0xFF, 0xFF, 0xFF, 0xFF, 0xFF, 0xFF, 0xFF, 0xFF, 0xFF, 0xFF, 0xFF, 0xFF, 0xFF,
+                0xFF, 0xFF, 0xFE},
+               {0x14, 0, 0, 0, 0, 0, 0, 0, 0, 0, 0, 0, 0, 0, 0, 0, 5}};
+  EXPECT_EQ(parse(b.build()), Value(Array{0xFFFFFFFEll, -2, 5}));
+}
+
+TEST(CodecTest, RealForms) {
+  struct Case {
+    const char* text;
+    double expected;
+  };
+  const Case cases[] = {
+      {"1.5", 1.5},      {"-0.25", -0.25},  {"+2", 2.0},
+      {" 1e10\n", 1e10}, {"inf", HUGE_VAL}, {"-inf", -HUGE_VAL},
+      {"-0", -0.0},      {".5", 0.5},       {"4.9406564584124654e-324", 4.9406564584124654e-324},
+  };
+  for (const Case& c : cases) {
+    ParseError error;
+    std::optional<Value> v =
+        parseText(plistXml(std::string("<real>") + c.text + "</real>"), &error);
+    ASSERT_TRUE(v) << c.text << ": " << error.message;
+    EXPECT_EQ(*v->real(), c.expected) << c.text;
+    EXPECT_EQ(std::signbit(*v->real()), std::signbit(c.expected)) << c.text;
+  }
+  std::optional<Value> nan = parseText(plistXml("<real>nan</real>"));
+  ASSERT_TRUE(nan);
+  EXPECT_TRUE(std::isnan(*nan->real()));
+
+  // A 4-byte binary real widens to a double.
+  BplistBuilder b;
+  b.objects = {{0x22, 0x3F, 0xC0, 0x00, 0x00}};
+  EXPECT_EQ(parse(b.build()), Value(1.5));
+}
+
+TEST(CodecTest, StringsNeedingUtf16) {
+  // é needs UTF-16; the emoji needs a surrogate pair.
+  Value v = Array{"plain", "\u00e9", "\U0001F600x"};
+  std::optional<Bytes> binary = writeBinary(v);
+  ASSERT_TRUE(binary);
+  EXPECT_TRUE(contains(*binary, {0x55, 'p', 'l', 'a', 'i', 'n'}));
+  EXPECT_TRUE(contains(*binary, {0x61, 0x00, 0xE9}));
+  EXPECT_TRUE(contains(*binary, {0x63, 0xD8, 0x3D, 0xDE, 0x00, 0x00, 'x'}));
+  EXPECT_EQ(parse(*binary), v);
+  EXPECT_EQ(parseText(*writeXml(v)), v);
+
+  // Strings of 15 characters and more carry their length as an integer object.
+  std::string longAscii(300, 'a');
+  binary = writeBinary(longAscii);
+  EXPECT_TRUE(contains(*binary, {0x5F, 0x11, 0x01, 0x2C, 'a'}));
+  EXPECT_EQ(parse(*binary), Value(longAscii));
+}
+
+TEST(CodecTest, BinaryWriterSharesEqualStrings) {
+  Array records;
+  for (int i = 0; i < 100; ++i) records.push_back(Dict{{"operation", "install"}});
+  std::optional<Bytes> binary = writeBinary(records);
+  ASSERT_TRUE(binary);
+  std::string text(binary->begin(), binary->end());
+  EXPECT_EQ(text.find("install"), text.rfind("install"));
+  EXPECT_EQ(text.find("operation"), text.rfind("operation"));
+  // Objects: the array, 100 dictionaries, one "operation" and one "install".
+  EXPECT_EQ((*binary)[binary->size() - 32 + 15], 103);
+  EXPECT_EQ(parse(*binary), Value(records));
+}
+
+TEST(CodecTest, SharedReferencesWithoutCyclesAreAllowed) {
+  // [A, A, "s", S] where A = ["s"] and S is the set {A}, read as an array: one object reached
+  // along several paths.
+  BplistBuilder b;
+  b.objects = {{0xA4, 1, 1, 2, 3}, {0xA1, 2}, {0x51, 's'}, {0xC1, 1}};
+  EXPECT_EQ(parse(b.build()), Value(Array{Array{"s"}, Array{"s"}, "s", Array{Array{"s"}}}));
+}
+
+TEST(CodecTest, XmlReaderAcceptsTheUsualForms) {
+  struct Case {
+    std::string xml;
+    Value expected;
+  };
+  const Case cases[] = {
+      // A byte-order mark, comments, processing instructions, CDATA and character references.
+      {"\xEF\xBB\xBF<?xml version=\"1.0\"?><!-- c --><plist><?pi x?><string>a&amp;&lt;&gt;&quot;"
+       "&apos;&#x41;&#66;<![CDATA[<raw>]]></string></plist>",
+       "a&<>\"'AB<raw>"},
+      // The standard DOCTYPE, and no version attribute.
+      {"<!DOCTYPE plist PUBLIC \"-//Example//DTD PLIST 1.0//EN\" "
+       "\"http://example.invalid/PropertyList-1.0.dtd\"><plist><true/></plist>",
+       true},
+      // No <plist> wrapper at all.
+      {"<dict><key>a</key><integer>1</integer></dict>", Dict{{"a", 1}}},
+      // Whitespace inside data and around numbers and dates; whitespace-only <string>.
+      {plistXml("<array><data>\n\tAAEC\n\tAw==\n</data><integer>\n 5 \n</integer>"
+                "<date> 2001-01-01T00:00:01Z </date><string>  </string><false></false></array>"),
+       Array{Bytes{0, 1, 2, 3}, 5, Date{1}, "  ", false}},
+      // Empty keys and strings, empty containers in both spellings.
+      {plistXml("<dict><key></key><string/><key>d</key><dict></dict><key>a</key><array/></dict>"),
+       Dict{{"", ""}, {"d", Dict{}}, {"a", Array{}}}},
+      // Dates at the ends of the range and on a leap day.
+      {plistXml("<array><date>0001-01-01T00:00:00Z</date><date>9999-12-31T23:59:59Z</date>"
+                "<date>2000-02-29T00:00:00Z</date></array>"),
+       Array{Date{-63113904000}, Date{252423993599}, Date{-86400 * 307}}},
+  };
+  for (const Case& c : cases) {
+    ParseError error;
+    EXPECT_EQ(parseText(c.xml, &error), c.expected) << c.xml << "\n" << error.message;
+  }
+}
+
+TEST(CodecTest, DepthLimitIsExact) {
+  for (Format format : {Format::Xml, Format::Binary}) {
+    std::optional<Bytes> deepest = write(nested(kMaxDepth), format);
+    ASSERT_TRUE(deepest);
+    EXPECT_TRUE(parse(*deepest));
+    std::string error;
+    EXPECT_FALSE(write(nested(kMaxDepth + 1), format, &error));
+    EXPECT_NE(error.find("nested deeper than 512 levels"), std::string::npos) << error;
+  }
+  // Readers: one level more than the writers allow.
+  std::string xml;
+  for (std::size_t i = 0; i <= kMaxDepth; ++i) xml += "<array>";
+  for (std::size_t i = 0; i <= kMaxDepth; ++i) xml += "</array>";
+  ParseError error;
+  EXPECT_FALSE(parseText(xml, &error));
+  EXPECT_EQ(error.message,
+            "XML property list, line 1, column 3585: containers nested deeper than 512 levels");
+}
+
+TEST(CodecTest, WritersRefuseWhatTheFormatCannotCarry) {
+  struct Case {
+    Value value;
+    Format format;
+    const char* error;
+  };
+  const Case cases[] = {
+      {Array{"ok", std::string("\xC3\x28")}, Format::Binary,
+       "binary property list: string is not valid UTF-8"},
+      {Dict{{std::string("\xFF"), 1}}, Format::Binary,
+       "binary property list: string is not valid UTF-8"},
+      {std::string("\xED\xA0\x80"), Format::Xml, "XML property list: string is not valid UTF-8"},
+      {Dict{{"k", std::string("a\x01")}}, Format::Xml,
+       "XML property list: control character U+0001 cannot be written in XML"},
+      {Dict{{std::string("\x1F"), 1}}, Format::Xml,
+       "XML property list: control character U+001F cannot be written in XML"},
+      {"\uFFFF", Format::Xml, "XML property list: character U+FFFF cannot be written in XML"},
+      {Date{1e300}, Format::Xml,
+       "XML property list: date <date 1e+300> is outside years 0001-9999"},
+      {Date{std::nan("")}, Format::Xml,
+       "XML property list: date <date nan> is outside years 0001-9999"},
+  };
+  for (const Case& c : cases) {
+    std::string error;
+    EXPECT_FALSE(write(c.value, c.format, &error)) << c.error;
+    EXPECT_EQ(error, c.error);
+  }
+  // What XML cannot carry is fine in binary, NUL included.
+  Value binaryOnly = Array{std::string("a\x01\0b", 4), Date{1e300}};
+  EXPECT_EQ(parse(*writeBinary(binaryOnly)), binaryOnly);
+}
+
+TEST(CodecTest, InputSizeIsBounded) {
+  auto big = std::make_unique_for_overwrite<std::uint8_t[]>(kMaxInputSize + 1);
+  ParseError error;
+  EXPECT_FALSE(parse({big.get(), kMaxInputSize + 1}, &error));
+  EXPECT_EQ(error.message,
+            "property list of 268435457 bytes is larger than the limit of 268435456 bytes");
+}
+
+}  // namespace
+}  // namespace appsync::plist
