@@ -143,9 +143,9 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
   checkProperty(store, path, identifier, std::nullopt, key);
   checkProperty(store, path, other, "2.0", key);
 
-  checkSetProperty(store, path, plist::Value("/var/mobile/Media/Downloads/a.ipa"), identifier,
+  checkSetProperty(store, path, plist::Value("/var/mobile/Media/Downloads/a.zip"), identifier,
                    std::nullopt, key);
-  checkSetProperty(store, path, plist::Value("/var/mobile/Media/Downloads/a.ipa"), identifier,
+  checkSetProperty(store, path, plist::Value("/var/mobile/Media/Downloads/a.zip"), identifier,
                    version, key);
   checkProperty(store, path, identifier, version, key);
   checkSetProperty(store, path, plist::Value(plist::Dict{{"n", 1}}), other, "2.0", "extra");
@@ -154,7 +154,7 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
   checkProperty(store, path, identifier, version, key);
   checkClean(store, path, other);
   // Whatever is left, a write on top of it (or on no file) must read back.
-  checkSetProperty(store, path, plist::Value("/x.ipa"), other, "3.0", key);
+  checkSetProperty(store, path, plist::Value("/x.zip"), other, "3.0", key);
   checkProperty(store, path, other, "3.0", key);
   return 0;
 }

@@ -26,12 +26,12 @@ class RestoreStateStoreTest : public ::testing::Test {
 };
 
 TEST_F(RestoreStateStoreTest, VersionsAreKeptApartAndCleanedTogether) {
-  store.setProperty("/pkg/a-1.ipa", "path", "com.a", std::string("1.0"));
-  store.setProperty("/pkg/a-2.ipa", "path", "com.a", std::string("2.0"));
-  store.setProperty("/pkg/b.ipa", "path", "com.b", std::string("1.0"));
+  store.setProperty("/pkg/a-1.zip", "path", "com.a", std::string("1.0"));
+  store.setProperty("/pkg/a-2.zip", "path", "com.a", std::string("2.0"));
+  store.setProperty("/pkg/b.zip", "path", "com.b", std::string("1.0"));
 
-  EXPECT_EQ(store.property("path", "com.a", std::string("1.0")), plist::Value("/pkg/a-1.ipa"));
-  EXPECT_EQ(store.property("path", "com.a", std::string("2.0")), plist::Value("/pkg/a-2.ipa"));
+  EXPECT_EQ(store.property("path", "com.a", std::string("1.0")), plist::Value("/pkg/a-1.zip"));
+  EXPECT_EQ(store.property("path", "com.a", std::string("2.0")), plist::Value("/pkg/a-2.zip"));
   EXPECT_EQ(store.property("path", "com.a", std::string("3.0")), std::nullopt);
   EXPECT_EQ(store.property("path", "com.a", std::nullopt), std::nullopt);
   EXPECT_EQ(store.property("other", "com.a", std::string("1.0")), std::nullopt);
@@ -46,22 +46,22 @@ TEST_F(RestoreStateStoreTest, VersionsAreKeptApartAndCleanedTogether) {
   store.clean("com.a");
   EXPECT_EQ(store.property("path", "com.a", std::string("1.0")), std::nullopt);
   EXPECT_EQ(store.property("path", "com.a", std::string("2.0")), std::nullopt);
-  EXPECT_EQ(store.property("path", "com.b", std::string("1.0")), plist::Value("/pkg/b.ipa"));
+  EXPECT_EQ(store.property("path", "com.b", std::string("1.0")), plist::Value("/pkg/b.zip"));
 }
 
 TEST_F(RestoreStateStoreTest, CleaningTheLastIdentifierDeletesTheFileAndAWriteRecreatesIt) {
-  store.setProperty("/pkg/a.ipa", "path", "com.a", std::string("1.0"));
+  store.setProperty("/pkg/a.zip", "path", "com.a", std::string("1.0"));
   store.clean("com.a");
   EXPECT_FALSE(fileExists(path));
   EXPECT_EQ(store.property("path", "com.a", std::string("1.0")), std::nullopt);
   store.clean("com.a");  // nothing to read: nothing happens
   EXPECT_FALSE(fileExists(path));
-  store.setProperty("/pkg/a.ipa", "path", "com.a", std::string("1.0"));
+  store.setProperty("/pkg/a.zip", "path", "com.a", std::string("1.0"));
   EXPECT_TRUE(fileExists(path));
 }
 
 TEST_F(RestoreStateStoreTest, AbsentVersionWritesNothing) {
-  store.setProperty("/pkg/a.ipa", "path", "com.a", std::nullopt);
+  store.setProperty("/pkg/a.zip", "path", "com.a", std::nullopt);
   EXPECT_FALSE(fileExists(path));
 }
 
@@ -79,7 +79,7 @@ TEST_F(RestoreStateStoreTest, UnusableFilesAnswerNothingAreNotRewrittenAndAreDel
     SCOPED_TRACE(name);
     writeText(path, content);
     EXPECT_EQ(store.property("path", "com.a", std::string("1.0")), std::nullopt);
-    store.setProperty("/pkg/a.ipa", "path", "com.a", std::string("1.0"));
+    store.setProperty("/pkg/a.zip", "path", "com.a", std::string("1.0"));
     EXPECT_EQ(readText(path), content);
     store.clean("com.a");
     EXPECT_FALSE(fileExists(path));

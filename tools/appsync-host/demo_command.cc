@@ -102,7 +102,7 @@ int runDemo(const std::string& root) {
   AppsClient::_notifyPavilion(device.platform(), false);
 
   std::printf("6. A restore package waits for its data; its path is remembered, then dropped.\n");
-  client->_setRestoreStatePropertyValue("/var/mobile/Media/PublicStaging/notes.ipa", "path",
+  client->_setRestoreStatePropertyValue("/var/mobile/Media/PublicStaging/notes.zip", "path",
                                         "com.example.notes", std::string("1.0"));
   auto recorded = client->_restoreStatePropertyForKey("path", "com.example.notes",
                                                       std::string("1.0"));

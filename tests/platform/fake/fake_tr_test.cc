@@ -16,12 +16,12 @@ TEST(TRAssetTest, DownloadAssetAndDescriptions) {
   EXPECT_TRUE(asset->isDownload());
   EXPECT_EQ(asset->prettyName(), "Example");
   EXPECT_EQ(asset->shortDescription(), "<TRAsset Application com.example.app>");
-  asset->setPath("/var/mobile/Media/PublicStaging/a b.ipa");
+  asset->setPath("/var/mobile/Media/PublicStaging/a b.zip");
   asset->setVariantOptions({{"AssetParts", 3}, {"Version", "1.0"}});
   const std::string text = asset->describe();
   EXPECT_EQ(text.find('\n'), std::string::npos);
   EXPECT_NE(text.find("com.example.app"), std::string::npos);
-  EXPECT_NE(text.find("path=/var/mobile/Media/PublicStaging/a b.ipa"), std::string::npos);
+  EXPECT_NE(text.find("path=/var/mobile/Media/PublicStaging/a b.zip"), std::string::npos);
 
   TRAsset upload("com.example.app", "Application", std::nullopt, false);
   EXPECT_FALSE(upload.isDownload());
