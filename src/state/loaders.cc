@@ -12,8 +12,8 @@ namespace {
 // Reads and parses `path`; absent without a message when the file is missing or empty, absent
 // with `parseMessage` when it is not a property list.
 std::optional<plist::Value> loadValue(TRHostFramework& tr, const std::string& path, ErrorRef* error,
-                                      std::string_view parseMessage) {
-  auto bytes = readFile(path, error);
+                                      std::string_view parseMessage, FileIdentity* identity) {
+  auto bytes = readFile(path, error, identity);
   if (!bytes || bytes->empty()) return std::nullopt;
   plist::ParseError parseError;
   auto value = plist::parse(*bytes, &parseError);
@@ -28,8 +28,8 @@ std::optional<plist::Value> loadValue(TRHostFramework& tr, const std::string& pa
 }  // namespace
 
 std::optional<plist::Array> loadTodoList(TRHostFramework& tr, const std::string& path,
-                                         ErrorRef* error) {
-  auto value = loadValue(tr, path, error, "%s|couldn't parse todo list");
+                                         ErrorRef* error, FileIdentity* identity) {
+  auto value = loadValue(tr, path, error, "%s|couldn't parse todo list", identity);
   if (!value) return std::nullopt;
   if (plist::Array* array = value->array()) return std::move(*array);
   pluginLog(tr.TRGetLogCategory(kAppSyncLogCategory), LogLevel::Error,
@@ -39,7 +39,7 @@ std::optional<plist::Array> loadTodoList(TRHostFramework& tr, const std::string&
 
 std::optional<plist::Dict> loadDemotedAppsList(TRHostFramework& tr, const std::string& path,
                                                ErrorRef* error) {
-  auto value = loadValue(tr, path, error, "%s|couldn't parse demoted apps list");
+  auto value = loadValue(tr, path, error, "%s|couldn't parse demoted apps list", nullptr);
   if (!value) return std::nullopt;
   if (plist::Dict* dict = value->dict()) return std::move(*dict);
   pluginLog(tr.TRGetLogCategory(kAppSyncLogCategory), LogLevel::Error,

@@ -2,6 +2,7 @@
 #include "state/todo_list.h"
 
 #include "runtime/fs/files.h"
+#include "runtime/plist/codec.h"
 #include "state/loaders.h"
 
 namespace appsync {
@@ -31,19 +32,7 @@ plist::Dict* findTodoRecord(plist::Array& list, std::string_view identifier) {
   return nullptr;
 }
 
-bool TodoList::FileIdentity::operator==(const FileIdentity& o) const {
-  return device == o.device && inode == o.inode && size == o.size &&
-         modified.tv_sec == o.modified.tv_sec && modified.tv_nsec == o.modified.tv_nsec &&
-         changed.tv_sec == o.changed.tv_sec && changed.tv_nsec == o.changed.tv_nsec;
-}
-
 TodoList::TodoList(std::string path, TRHostFramework& tr) : path_(std::move(path)), tr_(tr) {}
-
-std::optional<TodoList::FileIdentity> TodoList::identityOf() const {
-  struct stat st {};
-  if (::stat(path_.c_str(), &st) != 0) return std::nullopt;
-  return FileIdentity{st.st_dev, st.st_ino, st.st_size, st.st_mtim, st.st_ctim};
-}
 
 void TodoList::changeAssetID(const std::string& identifier, const std::string& state) {
   std::unique_lock lock(mutex_);
@@ -68,50 +57,71 @@ void TodoList::changeAssetID(const std::string& identifier, const std::string& s
   }
 }
 
-void TodoList::applyBatch(const std::vector<Change>& batch) {
-  // Reuse the list this object wrote last unless someone has replaced the file since.
-  std::optional<FileIdentity> identity = identityOf();
-  bool reuse = cached_ && identity && cachedIdentity_ && *identity == *cachedIdentity_;
-  std::optional<plist::Value> list;  // holds the root array
-  if (reuse) list = std::move(cached_);
+std::optional<plist::Array> TodoList::currentList(FileIdentity* identity) {
+  std::optional<plist::Array> cached = std::move(cached_);
   cached_.reset();
-  cachedIdentity_.reset();
-
-  bool changed = false;
-  for (const Change& change : batch) {
-    if (!list) {
-      ++loads_;
-      auto loaded = loadTodoList(tr_, path_, nullptr);
-      if (!loaded) continue;
-      list = plist::Value(std::move(*loaded));
-    }
-    plist::Array& records = *list->array();
-    if (records.empty()) continue;
-    plist::Dict* record = findTodoRecord(records, change.identifier);
-    if (!record) continue;
-    const plist::Value* current = record->find(kTodoOperationKey);
-    pluginLog(tr_.TRGetLogCategory(kAppSyncLogCategory), LogLevel::Default,
-              "%s|Changing %{public}@ from %{public}@ to %{public}@", change.identifier, current,
-              change.state);
-    record->set(std::string(kTodoOperationKey), change.state);
-    changed = true;
+  if (cached && fileIdentity(path_) == cachedIdentity_) {
+    *identity = cachedIdentity_;
+    return cached;
   }
-  if (!changed) {
-    if (reuse && list) {  // the file is still the one this object wrote
+  ++loads_;
+  return loadTodoList(tr_, path_, nullptr, identity);
+}
+
+void TodoList::applyBatch(const std::vector<Change>& batch) {
+  // A list replaced between our read and our write makes the write step aside; the batch is
+  // then applied to the new list. Bounded, so that a file replaced without pause cannot hold a
+  // writer forever.
+  constexpr int kMaxAttempts = 16;
+  for (int attempt = 0; attempt < kMaxAttempts; ++attempt) {
+    FileIdentity identity;
+    std::optional<plist::Array> list = currentList(&identity);
+    if (!list || list->empty()) return;
+
+    // The messages are written once the outcome is known, so that a change made again on a
+    // replacing list is reported once.
+    const LogCategory& log = tr_.TRGetLogCategory(kAppSyncLogCategory);
+    const bool logging = log.enabled(LogLevel::Default);
+    std::vector<std::string> messages;
+    bool changed = false;
+    for (const Change& change : batch) {
+      plist::Dict* record = findTodoRecord(*list, change.identifier);
+      if (!record) continue;
+      if (logging) {
+        const LogArg args[] = {LogArg(kPluginBundleIdentifier), LogArg(change.identifier),
+                               LogArg(record->find(kTodoOperationKey)), LogArg(change.state)};
+        messages.push_back(
+            formatLogMessage("%s|Changing %{public}@ from %{public}@ to %{public}@", args));
+      }
+      record->set(std::string(kTodoOperationKey), change.state);
+      changed = true;
+    }
+    if (!changed) {  // nothing matched: the file stays byte for byte as it is
       cached_ = std::move(list);
       cachedIdentity_ = identity;
+      return;
     }
-    return;
-  }
 
-  ++rewrites_;
-  if (writePlistAtomically(path_, *list, plist::Format::Binary)) {
-    cachedIdentity_ = identityOf();
-    if (cachedIdentity_) cached_ = std::move(list);
+    plist::Value root(std::move(*list));
+    std::optional<plist::Bytes> bytes = plist::writeBinary(root);
+    list = std::move(*root.array());
+    ReplaceOutcome outcome =
+        bytes ? replaceFileIfUnchanged(path_, *bytes, identity, &cachedIdentity_)
+              : ReplaceOutcome::Failed;
+    if (outcome == ReplaceOutcome::Changed) continue;
+    ++rewrites_;
+    for (const std::string& message : messages) log.write(LogLevel::Default, message);
+    if (outcome == ReplaceOutcome::Replaced) cached_ = std::move(list);
+    return;
   }
 }
 
 std::uint64_t TodoList::rewriteCount() const { return rewrites_.load(); }
 std::uint64_t TodoList::loadCount() const { return loads_.load(); }
+
+std::size_t TodoList::pendingChangeCount() {
+  std::lock_guard lock(mutex_);
+  return pending_.size();
+}
 
 }  // namespace appsync

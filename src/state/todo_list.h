@@ -3,8 +3,6 @@
 // another, and changes that arrive while a rewrite is running share the next rewrite.
 #pragma once
 
-#include <sys/stat.h>
-
 #include <atomic>
 #include <condition_variable>
 #include <cstdint>
@@ -14,6 +12,7 @@
 #include <vector>
 
 #include "platform/tr.h"
+#include "runtime/fs/files.h"
 #include "runtime/plist/value.h"
 
 namespace appsync {
@@ -43,29 +42,26 @@ class TodoList {
 
   // Sets the "operation" of the first record of `identifier` to `state` and rewrites the list
   // as a binary property list. Nothing is written when the list is absent, empty or does not
-  // parse, or when no record matches. Safe from any thread.
+  // parse, or when no record matches. A list that someone replaces while it is being changed
+  // is never overwritten: the change is made again on the list that replaced it. Safe from
+  // any thread.
   void changeAssetID(const std::string& identifier, const std::string& state);
 
   // How many times the file was rewritten and read since construction (for benchmarks/tests).
   std::uint64_t rewriteCount() const;
   std::uint64_t loadCount() const;
+  // Changes queued behind the rewrite that is running.
+  std::size_t pendingChangeCount();
 
  private:
   struct Change {
     std::string identifier;
     std::string state;
   };
-  struct FileIdentity {
-    dev_t device = 0;
-    ino_t inode = 0;
-    off_t size = 0;
-    timespec modified{};
-    timespec changed{};
-    bool operator==(const FileIdentity& o) const;
-  };
-
+  // The list to change: the one this object wrote last while the file is still that version,
+  // else the file as it is now. Absent when there is no usable list.
+  std::optional<plist::Array> currentList(FileIdentity* identity);
   void applyBatch(const std::vector<Change>& batch);
-  std::optional<FileIdentity> identityOf() const;
 
   const std::string path_;
   TRHostFramework& tr_;
@@ -79,9 +75,10 @@ class TodoList {
   bool writing_ = false;
 
   // Owned by the writing caller: the list as this object last wrote it, and the identity of
-  // the file it wrote, so an untouched file is not read and parsed again.
-  std::optional<plist::Value> cached_;
-  std::optional<FileIdentity> cachedIdentity_;
+  // the file it wrote (taken from the file itself), so an untouched file is not read and
+  // parsed again.
+  std::optional<plist::Array> cached_;
+  FileIdentity cachedIdentity_;
   std::atomic<std::uint64_t> rewrites_{0};
   std::atomic<std::uint64_t> loads_{0};
 };

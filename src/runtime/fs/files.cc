@@ -5,6 +5,8 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <stdio.h>  // renameat2
+
 #include <algorithm>
 #include <cerrno>
 #include <cstdio>
@@ -68,9 +70,77 @@ ssize_t readSome(int fd, std::uint8_t* data, std::size_t size) {
 
 int errnoOf(const std::error_code& ec) { return ec.value() != 0 ? ec.value() : EIO; }
 
+FileIdentity identityOf(const struct stat& st) {
+  return FileIdentity{st.st_dev, st.st_ino, st.st_size, st.st_mtim};
+}
+
+// Writes `bytes` to a new temporary file beside `path` (same directory, so that a rename stays
+// within one file system and is atomic), with the old file's permission bits (0644 for a new
+// file) and, where we may, its owner. Returns the temporary file's path, or absent with *error
+// set and nothing left behind. *identity receives the new file's identity.
+std::optional<std::string> writeTemporaryBeside(const std::string& path,
+                                                std::span<const std::uint8_t> bytes,
+                                                ErrorRef* error, FileIdentity* identity) {
+  std::string::size_type slash = path.rfind('/');
+  std::string directory = slash == std::string::npos ? std::string() : path.substr(0, slash + 1);
+  std::string name = slash == std::string::npos ? path : path.substr(slash + 1);
+  if (name.empty()) {
+    fail(error, EISDIR, path);
+    return std::nullopt;
+  }
+
+  mode_t mode = 0644;
+  struct stat old;
+  bool existed = ::stat(path.c_str(), &old) == 0;
+  if (existed) {
+    if (S_ISDIR(old.st_mode)) {
+      fail(error, EISDIR, path);
+      return std::nullopt;
+    }
+    mode = old.st_mode & 07777;
+  }
+
+  std::string temporary = directory + "." + name + ".XXXXXX";
+  FileDescriptor fd(::mkostemp(temporary.data(), O_CLOEXEC));
+  if (!fd.valid()) {
+    fail(error, errno, path);
+    return std::nullopt;
+  }
+  auto abandon = [&](int err) -> std::optional<std::string> {
+    if (fd.valid()) fd.close();
+    ::unlink(temporary.c_str());
+    fail(error, err, path);
+    return std::nullopt;
+  };
+  // Keep the old file's owner where we may (a privileged writer replacing a user's file);
+  // permission bits go after the owner, since a change of owner can clear some of them.
+  if (existed && (old.st_uid != ::geteuid() || old.st_gid != ::getegid())) {
+    (void)!::fchown(fd.get(), old.st_uid, old.st_gid);
+  }
+  if (::fchmod(fd.get(), mode) != 0) return abandon(errno);
+  if (!writeAll(fd.get(), bytes.data(), bytes.size())) return abandon(errno);
+  struct stat written;
+  if (::fstat(fd.get(), &written) != 0) return abandon(errno);
+  if (fd.close() != 0) return abandon(errno);
+  if (identity) *identity = identityOf(written);
+  return temporary;
+}
+
 }  // namespace
 
-std::optional<plist::Bytes> readFile(const std::string& path, ErrorRef* error) {
+bool FileIdentity::operator==(const FileIdentity& other) const {
+  return device == other.device && inode == other.inode && size == other.size &&
+         modified.tv_sec == other.modified.tv_sec && modified.tv_nsec == other.modified.tv_nsec;
+}
+
+std::optional<FileIdentity> fileIdentity(const std::string& path) {
+  struct stat st;
+  if (::stat(path.c_str(), &st) != 0) return std::nullopt;
+  return identityOf(st);
+}
+
+std::optional<plist::Bytes> readFile(const std::string& path, ErrorRef* error,
+                                     FileIdentity* identity) {
   FileDescriptor fd(::open(path.c_str(), O_RDONLY | O_CLOEXEC));
   if (!fd.valid()) {
     fail(error, errno, path);
@@ -89,6 +159,7 @@ std::optional<plist::Bytes> readFile(const std::string& path, ErrorRef* error) {
     fail(error, EFBIG, path);
     return std::nullopt;
   }
+  if (identity) *identity = identityOf(st);
   plist::Bytes bytes;
   // The size is only a hint: the file may change while it is read, and some files report 0.
   // One byte more than announced lets the loop see the end without another resize.
@@ -120,47 +191,54 @@ std::optional<plist::Bytes> readFile(const std::string& path, ErrorRef* error) {
 
 bool writeFileAtomically(const std::string& path, std::span<const std::uint8_t> bytes,
                          ErrorRef* error) {
-  std::string::size_type slash = path.rfind('/');
-  std::string directory = slash == std::string::npos ? std::string() : path.substr(0, slash + 1);
-  std::string name = slash == std::string::npos ? path : path.substr(slash + 1);
-  if (name.empty()) return fail(error, EISDIR, path);
-
-  mode_t mode = 0644;
-  struct stat old;
-  bool existed = ::stat(path.c_str(), &old) == 0;
-  if (existed) {
-    if (S_ISDIR(old.st_mode)) return fail(error, EISDIR, path);
-    mode = old.st_mode & 07777;
-  }
-
-  // Same directory, so that the rename stays within one file system and is atomic.
-  std::string temporary = directory + "." + name + ".XXXXXX";
-  FileDescriptor fd(::mkostemp(temporary.data(), O_CLOEXEC));
-  if (!fd.valid()) return fail(error, errno, path);
-
-  auto abandon = [&](int err) {
-    fd.close();
-    ::unlink(temporary.c_str());
-    return fail(error, err, path);
-  };
-  // Keep the old file's owner where we may (a privileged writer replacing a user's file);
-  // permission bits go after the owner, since a change of owner can clear some of them.
-  if (existed && (old.st_uid != ::geteuid() || old.st_gid != ::getegid())) {
-    (void)!::fchown(fd.get(), old.st_uid, old.st_gid);
-  }
-  if (::fchmod(fd.get(), mode) != 0) return abandon(errno);
-  if (!writeAll(fd.get(), bytes.data(), bytes.size())) return abandon(errno);
-  if (fd.close() != 0) {
+  std::optional<std::string> temporary = writeTemporaryBeside(path, bytes, error, nullptr);
+  if (!temporary) return false;
+  if (::rename(temporary->c_str(), path.c_str()) != 0) {
     int err = errno;
-    ::unlink(temporary.c_str());
-    return fail(error, err, path);
-  }
-  if (::rename(temporary.c_str(), path.c_str()) != 0) {
-    int err = errno;
-    ::unlink(temporary.c_str());
+    ::unlink(temporary->c_str());
     return fail(error, err, path);
   }
   return true;
+}
+
+ReplaceOutcome replaceFileIfUnchanged(const std::string& path, std::span<const std::uint8_t> bytes,
+                                      const FileIdentity& expected, FileIdentity* written,
+                                      ErrorRef* error) {
+  FileIdentity mine;
+  std::optional<std::string> temporary = writeTemporaryBeside(path, bytes, error, &mine);
+  if (!temporary) return ReplaceOutcome::Failed;
+  const char* tmp = temporary->c_str();
+  auto done = [&](ReplaceOutcome outcome) {
+    ::unlink(tmp);
+    if (outcome == ReplaceOutcome::Replaced && written) *written = mine;
+    return outcome;
+  };
+
+  if (::renameat2(AT_FDCWD, tmp, AT_FDCWD, path.c_str(), RENAME_EXCHANGE) != 0) {
+    if (errno == ENOENT) return done(ReplaceOutcome::Changed);  // removed since it was read
+    if (errno != EINVAL && errno != ENOSYS) {
+      fail(error, errno, path);
+      return done(ReplaceOutcome::Failed);
+    }
+    // A file system without exchange: check, then rename, which leaves a short window.
+    if (fileIdentity(path) != expected) return done(ReplaceOutcome::Changed);
+    if (::rename(tmp, path.c_str()) != 0) {
+      fail(error, errno, path);
+      return done(ReplaceOutcome::Failed);
+    }
+    if (written) *written = mine;
+    return ReplaceOutcome::Replaced;
+  }
+  // The displaced file now lies at the temporary name.
+  if (fileIdentity(*temporary) == expected) return done(ReplaceOutcome::Replaced);
+
+  // Someone replaced the file after it was read: put their version back. Should yet another
+  // version have arrived over ours meanwhile, it is the newest and takes the path instead.
+  if (::renameat2(AT_FDCWD, tmp, AT_FDCWD, path.c_str(), RENAME_EXCHANGE) == 0 &&
+      fileIdentity(*temporary) != mine) {
+    ::rename(tmp, path.c_str());
+  }
+  return done(ReplaceOutcome::Changed);
 }
 
 bool writePlistAtomically(const std::string& path, const plist::Value& value, plist::Format format,

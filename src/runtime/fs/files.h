@@ -2,7 +2,10 @@
 // Failures come back as POSIX errors naming the path; nothing throws.
 #pragma once
 
+#include <sys/types.h>
+
 #include <cstdint>
+#include <ctime>
 #include <optional>
 #include <span>
 #include <string>
@@ -14,9 +17,24 @@
 
 namespace appsync {
 
+// One version of a file: the same inode with the same size and modification time. A file
+// replaced by a rename, or rewritten in place, has another identity.
+struct FileIdentity {
+  dev_t device = 0;
+  ino_t inode = 0;
+  off_t size = 0;
+  timespec modified{};
+  bool operator==(const FileIdentity& other) const;
+};
+
+// The identity of the file at `path` now; absent when there is none.
+std::optional<FileIdentity> fileIdentity(const std::string& path);
+
 // Reads a whole file, without caching. Absent (and *error set) when it cannot be read, or when
-// it is larger than the property-list size bound.
-std::optional<plist::Bytes> readFile(const std::string& path, ErrorRef* error = nullptr);
+// it is larger than the property-list size bound. *identity (when given) receives the identity
+// of the file that was read, taken from the open file itself.
+std::optional<plist::Bytes> readFile(const std::string& path, ErrorRef* error = nullptr,
+                                     FileIdentity* identity = nullptr);
 
 // Replaces `path` with `bytes` so that any reader, and any crash of this process, sees either the
 // old file or the new one: a temporary file in the same directory is written completely, then
@@ -26,6 +44,21 @@ std::optional<plist::Bytes> readFile(const std::string& path, ErrorRef* error = 
 // killed in the middle may leave its temporary file (".NAME.XXXXXX") behind.
 bool writeFileAtomically(const std::string& path, std::span<const std::uint8_t> bytes,
                          ErrorRef* error = nullptr);
+
+enum class ReplaceOutcome {
+  Replaced,  // `path` now holds the new bytes
+  Changed,   // `path` was no longer the expected version (or was gone); it was left as found
+  Failed,    // the new file could not be written; `path` was left as it was (*error says why)
+};
+
+// Writes `bytes` over `path` like writeFileAtomically, but only while `path` is still the
+// version `expected`: the new file is exchanged atomically with whatever is there, and the
+// displaced file is put back when it turns out to be another version. So a file that someone
+// else replaced after it was read is never overwritten with what was derived from the old one.
+// *written (when given) receives the identity of the new file after a replacement.
+ReplaceOutcome replaceFileIfUnchanged(const std::string& path, std::span<const std::uint8_t> bytes,
+                                      const FileIdentity& expected, FileIdentity* written,
+                                      ErrorRef* error = nullptr);
 
 // Serialises `value` in `format` and writes it atomically. A value the format cannot carry is
 // an error of kPropertyListErrorDomain with the codec's message and the path.
