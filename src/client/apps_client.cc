@@ -21,6 +21,7 @@ plist::Array toArray(const std::set<std::string>& items) {
 
 AppsClient::AppsClient(const Platform& platform)
     : platform_(platform),
+      insideHostDaemon_(platform.system.mainBundleIdentifier() == kHostDaemonBundleIdentifier),
       todoList_(platform.paths.todoList(), platform.tr),
       restoreStateStore_(platform.paths.restoreState()) {
   _installGroup = std::make_unique<Group>();
@@ -33,27 +34,26 @@ AppsClient::AppsClient(const Platform& platform)
   _accessQueue = std::make_unique<SerialQueue>(std::string(kAccessQueueLabel));
   _restoreQueue = std::make_unique<SerialQueue>(std::string(kRestoreQueueLabel));
 
-  platform_.ar.addObserver(this);
-
   {
     auto log = std::make_shared<const OSLogObject>(
         OSLogObject{"com.vantor.appinstallation", "trc.appsync"});
     platform_.transactionLog.initializeWithLog(log);
   }  // the client keeps no reference to the log object
 
-  _finishedWaitingForPlaceHolderInstalls = false;
   _useInstallCoordinator = platform_.kc.coordinationIsEnabled();
   _restoringPlaceholderCount = 0;
-
   _updatingApps.clear();
   _userCancelledApps.clear();
+  // Inside the host daemon nobody waits for placeholder installs.
+  _finishedWaitingForPlaceHolderInstalls = insideHostDaemon_;
 
-  insideHostDaemon_ = platform_.system.mainBundleIdentifier() == kHostDaemonBundleIdentifier;
+  // Registrations come last: from here on callbacks arrive on the services' threads, and each
+  // must find every field built.
+  platform_.ar.addObserver(this);
   if (insideHostDaemon_) {
-    _finishedWaitingForPlaceHolderInstalls = true;
-    platform_.system.addNotificationObserver(this,
-                                             &AppsClient::_handleTRCStartupCompletedNotification,
-                                             std::string(kHostStartupNotification));
+    platform_.system.addNotificationObserver(
+        this, &AppsClient::_handleTRCStartupCompletedNotification,
+        std::string(kHostStartupNotification));
   }
 }
 
@@ -73,18 +73,24 @@ AppsClient::~AppsClient() {
   _outstandingPFTTransfers.clear();
   _uninstalledApps.reset();
 
+  // Every unregistration below returns only when no callback for the client is running or
+  // will run; no client lock is held across them, so a callback in flight may still call in.
   platform_.ar.removeObserver(this);
-
   if (insideHostDaemon_) {
     platform_.system.removeNotificationObserver(this, std::string(kHostStartupNotification));
-    std::lock_guard lock(observerMutex_);
-    _appInstallObserver.reset();
+    std::shared_ptr<KCAppInstallObserver> observer;
+    {
+      std::lock_guard lock(observerMutex_);
+      observer.swap(_appInstallObserver);
+    }
+    observer.reset();
   }
-
   // The coordination service holds the client as an observer of its coordinators.
   platform_.kc.removeObserver(this);
 
-  // Install operations hold the client; none may outlive it.
+  // Installs hold the client: wait for every one queued, running or waiting for a retry, then
+  // for the queue itself.
+  _installGroup->wait();
   _installOperationQueue.reset();
 }
 
@@ -107,10 +113,18 @@ void AppsClient::_handleTRCStartupCompletedNotification(void* /*center*/, void* 
 }
 
 void AppsClient::setupInstallCoordinatorObserver() {
-  std::lock_guard lock(observerMutex_);
-  if (_appInstallObserver) return;
-  _appInstallObserver = platform_.kc.initAppInstallObserver(
+  {
+    std::lock_guard lock(observerMutex_);
+    if (_appInstallObserver || creatingObserver_) return;
+    creatingObserver_ = true;
+  }
+  // Created without the lock: the service may deliver events, which may ask about the
+  // observer, before this call returns.
+  std::shared_ptr<KCAppInstallObserver> observer = platform_.kc.initAppInstallObserver(
       std::string(kInstallObserverServiceName), {kAppSyncCoordinationClient}, this);
+  std::lock_guard lock(observerMutex_);
+  _appInstallObserver = std::move(observer);
+  creatingObserver_ = false;
 }
 
 bool AppsClient::hasInstallCoordinatorObserver() const {

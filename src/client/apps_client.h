@@ -44,8 +44,9 @@ class AppsClient : public TRClient,
   // Builds every field, registers with the registry, initialises the transaction log, chooses
   // the installation road and, inside the host daemon, listens for its start-up notification.
   explicit AppsClient(const Platform& platform);
-  // Logs unfinished work, unregisters, then waits for install operations still queued or
-  // running so that none outlives the client.
+  // Logs unfinished work, unregisters from every service (each waits for its callbacks in
+  // flight), then waits for every install queued, running or waiting for a retry, so that
+  // nothing that holds the client outlives it.
   ~AppsClient() override;
   AppsClient(const AppsClient&) = delete;
   AppsClient& operator=(const AppsClient&) = delete;
@@ -192,14 +193,19 @@ class AppsClient : public TRClient,
   // Members of _restorePlaceHoldersWaitGroup. Changed on _restoreQueue.
   std::int64_t _restoringPlaceholderCount = 0;
 
+  // Whether the client runs inside the host daemon; fixed at construction.
+  const bool insideHostDaemon_;
+
   // The todo list's writer and the restore state store, each with its own lock.
   TodoList todoList_;
   RestoreStateStore restoreStateStore_;
 
-  // Makes the at-most-once creation of the coordination observer safe when start-up
-  // notifications race.
+  // Guards _appInstallObserver and creatingObserver_ only; never held across a call into a
+  // service, so a delivery that asks about the observer cannot wait on a creation or a
+  // teardown that waits on it.
   mutable std::mutex observerMutex_;
-  bool insideHostDaemon_ = false;
+  // True while setupInstallCoordinatorObserver creates the observer outside the lock.
+  bool creatingObserver_ = false;
 };
 
 }  // namespace appsync
