@@ -131,53 +131,81 @@ class ARApplicationProxy : public ARBundleProxy {
 
 using ARProxyList = std::vector<std::shared_ptr<const ARApplicationProxy>>;
 
-// Registry change notifications. Each is optional: the default ignores the event.
+// Registry change notifications. Each is optional: the default ignores the event. Events come
+// on a registry thread, never from within the call that made the change, one at a time and in
+// the order the changes happened, with no registry lock held: a callback may call the
+// registry. The proxy lists are shared snapshots.
 class ARApplicationWorkspaceObserverProtocol {
  public:
   virtual ~ARApplicationWorkspaceObserverProtocol() = default;
+  // The installs the registry runs now, and those it has paused.
   virtual void applicationInstallsArePrioritized(const ARProxyList& prioritized,
                                                  const ARProxyList& paused) {
     (void)prioritized, (void)paused;
   }
   virtual void applicationInstallsDidCancel(const ARProxyList& proxies) { (void)proxies; }
+  // After a package or placeholder install succeeded.
   virtual void applicationsDidInstall(const ARProxyList& proxies) { (void)proxies; }
+  // After an uninstall succeeded.
   virtual void applicationsDidUninstall(const ARProxyList& proxies) { (void)proxies; }
 };
 
-// The default workspace. Every operation is safe from any thread.
+// The default workspace: the registry of installed and placeholder applications, keyed by
+// application identifier (compared exactly). Every operation is safe from any thread. Proxies it
+// hands out are snapshots shared with the caller; they may outlive the registry.
 class ARApplicationWorkspace {
  public:
   using BundleBlock =
       std::function<void(const std::shared_ptr<const ARBundleProxy>& proxy, bool* stop)>;
 
+  ARApplicationWorkspace() = default;
   virtual ~ARApplicationWorkspace() = default;
+  ARApplicationWorkspace(const ARApplicationWorkspace&) = delete;
+  ARApplicationWorkspace& operator=(const ARApplicationWorkspace&) = delete;
 
-  // Registers `observer` (not owned). Soon after, on a registry thread, the registry delivers
-  // applicationInstallsArePrioritized:arePaused: with the installs it currently runs; later
-  // events follow as they happen, on registry threads.
+  // Registers `observer` (not owned; null is ignored). Cannot fail. Soon after, on a registry
+  // thread, it receives applicationInstallsArePrioritized with the installs running now; later
+  // events follow as they happen.
   virtual void addObserver(ARApplicationWorkspaceObserverProtocol* observer) = 0;
-  // After this returns no callback for `observer` is running or will run.
+  // Removes every registration of `observer` (none: nothing happens). When this returns no
+  // callback for it is running or will run, except that called from a registry callback it
+  // does not wait for that callback, which is the caller's own.
   virtual void removeObserver(ARApplicationWorkspaceObserverProtocol* observer) = 0;
 
+  // True for a fully installed application; false for an unknown identifier, a placeholder, a
+  // bundle that is not an application, or a failed query.
   virtual bool applicationIsInstalled(const std::string& identifier) = 0;
-  // True on success. `options` may be absent.
+  // Removes the application; applicationsDidUninstall follows. False, with nothing removed, for
+  // an unknown identifier, a bundle that is not an application, or a refusal. `options` may be
+  // absent.
   virtual bool uninstallApplication(const std::string& identifier,
                                     const std::optional<plist::Dict>& options) = 0;
-  // Installs the bundle directory (a placeholder package) at `path`. True on success.
+  // Installs the placeholder bundle directory at `path` (its Info.plist names the application)
+  // with `options` PackageType "Placeholder"; an installed application becomes a placeholder.
+  // applicationsDidInstall follows. False, with nothing changed, when the directory or the
+  // options do not make a placeholder.
   virtual bool installApplication(const std::string& path, const plist::Dict& options) = 0;
-  // Installs a delivered package; on failure *error (when given) receives the reason.
+  // Installs the delivered bundle directory at `path`, whose identifier must equal `options`
+  // BNBundleIdentifier, completing any install progress of the application;
+  // applicationsDidInstall follows. False on failure, with *error (when given) set.
   virtual bool installApplication(const std::string& path, const plist::Dict& options,
                                   ErrorRef* error) = 0;
-  // Calls `block` synchronously on the calling thread, once per bundle of `type`, in the
-  // registry's order, until the block sets *stop.
+  // Calls `block` synchronously on the calling thread, once per bundle of `type` (an
+  // ARBundleType; other kinds hold nothing), in the registry's order, until the block sets
+  // *stop. No registry lock is held meanwhile. When the query fails the block is not called.
   virtual void enumerateBundlesOfType(int type, const BundleBlock& block) = 0;
-  // The progress object of the application's install in `phase`, created if needed; null when
-  // the registry does not know the application.
+  // The progress of the application's install in `phase`: created if needed, then the same
+  // object until a package install completes; later proxies report the latest one handed out
+  // as installProgressSync. Shared with the registry; null for an unknown application or a
+  // failed query.
   virtual std::shared_ptr<ARInstallProgress> installProgressForApplication(
       const ARApplicationProxy& proxy, std::uint64_t phase) = 0;
+  // Closes the phase of `progress`. Cannot fail.
   virtual void installPhaseFinishedForProgress(
       const std::shared_ptr<ARInstallProgress>& progress) = 0;
-  // The application with this identifier; with `placeholder` true a placeholder also counts.
+  // A fresh snapshot of the application; with `placeholder` false a placeholder is not found.
+  // Null when no application has the identifier (non-application bundles never count) or the
+  // query failed.
   virtual std::shared_ptr<const ARApplicationProxy> applicationProxyForIdentifier(
       const std::string& identifier, bool placeholder) = 0;
 };

@@ -41,13 +41,19 @@ class EMInstallOptions {
   std::uint64_t installTargetType_ = 0;
 };
 
+// The low-level installer. Safe from any thread.
 class EMInstaller {
  public:
+  EMInstaller() = default;
   virtual ~EMInstaller() = default;
+  EMInstaller(const EMInstaller&) = delete;
+  EMInstaller& operator=(const EMInstaller&) = delete;
+
   // Applications the installer has uninstalled and not yet been told to forget, keyed by
   // identifier. The caller owns the dictionary. Null when the list is unavailable.
   virtual std::unique_ptr<plist::Dict> EmplaceLookupUninstalled(const plist::Dict* options) = 0;
-  // Forgets the given identifiers. 0 on success, an error status otherwise.
+  // Forgets the given identifiers (unknown ones are ignored). 0 on success; otherwise an error
+  // status, and nothing is forgotten.
   virtual int EmplaceClearUninstalled(const std::vector<std::string>& identifiers,
                                       const plist::Dict* options) = 0;
 };

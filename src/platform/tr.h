@@ -108,31 +108,43 @@ class TRMutableAccountInfo {
   std::optional<std::string> altPRID_;
 };
 
-// The host's device service. Hosts of older versions lack some operations; ask first.
+// The host's device service. Hosts of older versions lack some operations; ask first. Safe from any
+// thread.
 class TRDeviceService {
  public:
   enum class Operation { prioritizeAsset, cancelAssetTransferForFailedAsset };
 
+  TRDeviceService() = default;
   virtual ~TRDeviceService() = default;
-  // Whether the running host offers `operation` (calling one it does not offer aborts).
+  TRDeviceService(const TRDeviceService&) = delete;
+  TRDeviceService& operator=(const TRDeviceService&) = delete;
+
+  // Whether the running host offers `operation`. Cannot fail. Calling an operation the host
+  // does not offer aborts the process.
   virtual bool respondsTo(Operation operation) const = 0;
-  // Asks the host to move one transfer to the front. `completion` runs exactly once, on a
-  // thread of the host's choosing, with the error or null.
+  // Asks the host to move one transfer to the front (`asset` is shared with it). Returns at
+  // once; `completion` runs exactly once, on a host thread (never the caller's), with the
+  // failure or null.
   virtual void prioritizeAsset(std::shared_ptr<TRAsset> asset,
                                std::function<void(ErrorRef)> completion) = 0;
-  // Gives up a transfer whose install was cancelled. Returns at once.
+  // Gives up a transfer whose install was cancelled. Returns at once; reports no failure.
   virtual void cancelAssetTransferForFailedAsset(std::shared_ptr<TRAsset> asset) = 0;
 };
 
+// The host sync framework's functions. Safe from any thread.
 class TRHostFramework {
  public:
+  TRHostFramework() = default;
   virtual ~TRHostFramework() = default;
-  // The log object of category `category` (0, 8 and 14 are used); valid for the framework's
-  // lifetime; safe from any thread.
+  TRHostFramework(const TRHostFramework&) = delete;
+  TRHostFramework& operator=(const TRHostFramework&) = delete;
+
+  // The log object of category `category` (0, 8 and 14 are used). Cannot fail; owned by the
+  // framework and valid for its lifetime; safe from any thread.
   virtual LogCategory& TRGetLogCategory(int category) = 0;
-  // Whether a later retry of whatever failed with `error` can succeed.
+  // Whether a later retry of whatever failed with `error` can succeed. False for null.
   virtual bool TRIsRecoverableError(const ErrorRef& error) = 0;
-  // The shared device service; never null.
+  // The device service, shared by every caller: the same object each call, never null.
   virtual std::shared_ptr<TRDeviceService> TRDeviceServiceSharedInstance() = 0;
 };
 

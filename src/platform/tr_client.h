@@ -61,13 +61,17 @@ enum class TRClientOperation {
 
 const char* operationName(TRClientOperation operation);
 
+// What the plugin implements; the host calls it on threads of the host's choosing.
 class TRClient {
  public:
+  TRClient() = default;
   virtual ~TRClient() = default;
+  TRClient(const TRClient&) = delete;
+  TRClient& operator=(const TRClient&) = delete;
 
-  // Required.
+  // Required: the dataclasses the client serves, a copy for the host. Cannot fail.
   virtual std::vector<std::string> supportedDataclasses() = 0;
-  // Whether the client implements an optional operation.
+  // Whether the client implements an optional operation. Cannot fail.
   virtual bool respondsTo(TRClientOperation operation) const = 0;
 
   // Optional operations.

@@ -1,6 +1,7 @@
 // Placeholder lookup: one application's, all of them with a callback, and system placeholders.
 #include <gtest/gtest.h>
 
+#include "platform/ar_wrapper.h"
 #include "restore/placeholder_fixture.h"
 
 namespace appsync {
@@ -12,11 +13,11 @@ using AppRecord = FakeARWorkspace::AppRecord;
 
 // The device's registry, except that enumeration hands out a fixed list of bundles (which may
 // repeat an identifier, as no real registry record can) and counts the bundles it visits.
-class ListedBundles final : public ARApplicationWorkspace {
+class ListedBundles final : public ARApplicationWorkspaceWrapper {
  public:
-  ListedBundles(ARApplicationWorkspace& base,
+  ListedBundles(ARApplicationWorkspace& target,
                 std::vector<std::shared_ptr<const ARBundleProxy>> list)
-      : base_(base), list_(std::move(list)) {}
+      : ARApplicationWorkspaceWrapper(target), list_(std::move(list)) {}
 
   void enumerateBundlesOfType(int type, const BundleBlock& block) override {
     types.push_back(type);
@@ -27,41 +28,11 @@ class ListedBundles final : public ARApplicationWorkspace {
       if (stop) break;
     }
   }
-  void addObserver(ARApplicationWorkspaceObserverProtocol* o) override { base_.addObserver(o); }
-  void removeObserver(ARApplicationWorkspaceObserverProtocol* o) override {
-    base_.removeObserver(o);
-  }
-  bool applicationIsInstalled(const std::string& id) override {
-    return base_.applicationIsInstalled(id);
-  }
-  bool uninstallApplication(const std::string& id,
-                            const std::optional<plist::Dict>& options) override {
-    return base_.uninstallApplication(id, options);
-  }
-  bool installApplication(const std::string& path, const plist::Dict& options) override {
-    return base_.installApplication(path, options);
-  }
-  bool installApplication(const std::string& path, const plist::Dict& options,
-                          ErrorRef* error) override {
-    return base_.installApplication(path, options, error);
-  }
-  std::shared_ptr<ARInstallProgress> installProgressForApplication(const ARApplicationProxy& p,
-                                                                   std::uint64_t phase) override {
-    return base_.installProgressForApplication(p, phase);
-  }
-  void installPhaseFinishedForProgress(const std::shared_ptr<ARInstallProgress>& p) override {
-    base_.installPhaseFinishedForProgress(p);
-  }
-  std::shared_ptr<const ARApplicationProxy> applicationProxyForIdentifier(
-      const std::string& id, bool placeholder) override {
-    return base_.applicationProxyForIdentifier(id, placeholder);
-  }
 
   std::vector<int> types;
   int visited = 0;
 
  private:
-  ARApplicationWorkspace& base_;
   std::vector<std::shared_ptr<const ARBundleProxy>> list_;
 };
 
@@ -79,11 +50,7 @@ TEST(PlaceholderLookupTest, ExistsStopsAtTheFirstMatchAndComparesExactly) {
       device.ar(), {application("other", true), application("com.Example.App", true),
                     application("com.example.app", false), application("com.example.app", true),
                     application("last", true)});
-  const Platform& base = device.platform();
-  const Platform platform{base.tr,     bundles,   base.kc, base.em, base.sw,
-                          base.rs,     base.bz,   base.pv, base.qi, base.transactionLog,
-                          base.system, base.paths};
-  AppsClient client(platform);
+  AppsClient client(device.platform().with(bundles));
 
   // Any application with the identifier counts, placeholder or not; the walk ends there.
   EXPECT_TRUE(client._placeholderExistsForApplication("com.example.app"));
