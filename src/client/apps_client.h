@@ -143,6 +143,9 @@ class AppsClient : public TRClient,
   std::string describe() const;
 
  private:
+  // Tests reach the fields that no landed operation fills yet through this.
+  friend struct AppsClientTestAccess;
+
   // Messages of the client. Category 8 unless named; the "%s|" prefix is filled in.
   template <typename... Args>
   void logDefault(std::string_view format, const Args&... args) const {

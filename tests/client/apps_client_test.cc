@@ -4,13 +4,28 @@
 
 #include <gtest/gtest.h>
 
+#include <atomic>
+#include <set>
 #include <thread>
 #include <vector>
 
+#include "platform/ar_wrapper.h"
 #include "platform/fake/fake_platform.h"
+#include "platform/kc_wrapper.h"
+#include "platform/system_wrapper.h"
 #include "support/temp_dir.h"
 
 namespace appsync {
+
+struct AppsClientTestAccess {
+  static void addOutstandingTransfer(AppsClient& client, std::string id) {
+    client._outstandingPFTTransfers.insert(std::move(id));
+  }
+  static void addRestoringPlaceholder(AppsClient& client, std::string id) {
+    client._restoreQueue->sync([&] { client._placeholdersForRestoringApps.insert(id); });
+  }
+};
+
 namespace {
 
 FakePlatform::Options insideHostDaemon(bool coordination = true) {
@@ -39,6 +54,173 @@ TEST(AppsClientTest, ConstructionRegistersInitialisesAndChoosesTheRoad) {
     }
     EXPECT_EQ(device.ar().observerCount(), 0u);
   }
+}
+
+// What a service sees of the client at the moment the client registers with it.
+struct SeenAtRegistration {
+  bool registered = false;
+  bool useInstallCoordinator = false;
+  bool finishedWaiting = false;
+};
+
+SeenAtRegistration look(void* observer) {
+  auto* client = static_cast<AppsClient*>(observer);
+  return {true, client->useInstallCoordinator(), client->finishedWaitingForPlaceHolderInstalls()};
+}
+
+class WatchedRegistry : public ARApplicationWorkspaceWrapper {
+ public:
+  using ARApplicationWorkspaceWrapper::ARApplicationWorkspaceWrapper;
+  void addObserver(ARApplicationWorkspaceObserverProtocol* observer) override {
+    seen = look(dynamic_cast<AppsClient*>(observer));
+    ARApplicationWorkspaceWrapper::addObserver(observer);
+  }
+  SeenAtRegistration seen;
+};
+
+class WatchedSystem : public SystemServicesWrapper {
+ public:
+  using SystemServicesWrapper::SystemServicesWrapper;
+  void addNotificationObserver(void* observer, NotificationCallback callback,
+                               const std::string& name) override {
+    seen = look(observer);
+    SystemServicesWrapper::addNotificationObserver(observer, callback, name);
+  }
+  SeenAtRegistration seen;
+};
+
+TEST(AppsClientTest, ServicesSeeAWholeClientWhenItRegisters) {
+  for (bool coordination : {false, true}) {
+    for (bool host : {false, true}) {
+      SCOPED_TRACE(::testing::Message() << "coordination " << coordination << " host " << host);
+      testing::TempDir root;
+      FakePlatform device(
+          root.path(), host ? insideHostDaemon(coordination) : [&] {
+            FakePlatform::Options options;
+            options.coordination = coordination;
+            return options;
+          }());
+      WatchedRegistry registry(device.ar());
+      WatchedSystem system(device.system());
+      AppsClient client(device.platform().with(registry).with(system));
+      EXPECT_TRUE(registry.seen.registered);
+      EXPECT_EQ(registry.seen.useInstallCoordinator, coordination);
+      EXPECT_EQ(registry.seen.finishedWaiting, host);
+      EXPECT_EQ(system.seen.registered, host);
+      EXPECT_EQ(system.seen.useInstallCoordinator, host && coordination);
+    }
+  }
+}
+
+// Asks the client about its observer from another thread, as a delivery on a service thread
+// would, while the service is creating or dropping that observer.
+bool askFromAnotherThread(AppsClient* client) {
+  bool has = false;
+  std::thread([&] { has = client->hasInstallCoordinatorObserver(); }).join();
+  return has;
+}
+
+class ObserverThatAsksWhenDropped : public KCAppInstallObserver {
+ public:
+  ObserverThatAsksWhenDropped(std::shared_ptr<KCAppInstallObserver> inner, AppsClient* client)
+      : inner_(std::move(inner)), client_(client) {}
+  ~ObserverThatAsksWhenDropped() override { askFromAnotherThread(client_); }
+  const std::string& machServiceName() const override { return inner_->machServiceName(); }
+  const std::set<std::uint64_t>& clients() const override { return inner_->clients(); }
+
+ private:
+  std::shared_ptr<KCAppInstallObserver> inner_;
+  AppsClient* client_;
+};
+
+class CoordinationThatAsks : public KCInstallCoordinationWrapper {
+ public:
+  using KCInstallCoordinationWrapper::KCInstallCoordinationWrapper;
+  std::shared_ptr<KCAppInstallObserver> initAppInstallObserver(
+      const std::string& machServiceName, const std::set<std::uint64_t>& clients,
+      KCAppInstallObserverDelegate* delegate) override {
+    serviceName = machServiceName;
+    clientNumbers = clients;
+    auto observer =
+        KCInstallCoordinationWrapper::initAppInstallObserver(machServiceName, clients, delegate);
+    askedDuringCreation = askFromAnotherThread(client);
+    return std::make_shared<ObserverThatAsksWhenDropped>(observer, client);
+  }
+  AppsClient* client = nullptr;
+  std::string serviceName;
+  std::set<std::uint64_t> clientNumbers;
+  bool askedDuringCreation = true;
+};
+
+TEST(AppsClientTest, TheObserverIsCreatedAndDroppedWithoutHoldingTheClient) {
+  testing::TempDir root;
+  FakePlatform device(root.path(), insideHostDaemon());
+  CoordinationThatAsks coordination(device.kc());
+  {
+    AppsClient client(device.platform().with(coordination));
+    coordination.client = &client;
+    device.system().postNotification("com.vantor.trc.TRStartupCompleteNotification");
+    EXPECT_FALSE(coordination.askedDuringCreation);
+    EXPECT_TRUE(client.hasInstallCoordinatorObserver());
+  }  // dropping the observer asks again
+  EXPECT_EQ(coordination.serviceName, "com.vantor.trc.zpc.icappobserverdelegate");
+  EXPECT_EQ(coordination.clientNumbers, std::set<std::uint64_t>{3});
+}
+
+TEST(AppsClientTest, TeardownWaitsForCallbacksInFlight) {
+  // Start-up notifications and coordinator events keep arriving on the services' threads while
+  // the client goes away; none may reach it afterwards (AddressSanitizer would see the freed
+  // client) and none may deadlock with the teardown.
+  for (int round = 0; round < 20; ++round) {
+    testing::TempDir root;
+    FakePlatform device(root.path(), insideHostDaemon());
+    device.kc().putCoordinator(KCCoordinatorKind::Initiating, "com.a", kAppSyncCoordinationClient);
+    auto client = std::make_unique<AppsClient>(device.platform());
+    std::atomic<bool> stop{false};
+    std::thread notifications([&] {
+      while (!stop)
+        device.system().postNotification("com.vantor.trc.TRStartupCompleteNotification");
+    });
+    std::thread events([&] {
+      while (!stop) device.kc().requestPrioritize("com.a");
+    });
+    while (!client->hasInstallCoordinatorObserver()) std::this_thread::yield();
+    client.reset();
+    stop = true;
+    notifications.join();
+    events.join();
+    device.kc().drain();
+    device.system().drain();
+  }
+}
+
+TEST(AppsClientTest, TeardownReportsUnfinishedWorkAtErrorLevel) {
+  testing::TempDir root;
+  FakePlatform device(root.path());
+  std::string name;
+  {
+    AppsClient client(device.platform());
+    name = client.describe();
+    AppsClientTestAccess::addOutstandingTransfer(client, "com.a");
+    AppsClientTestAccess::addOutstandingTransfer(client, "com.b");
+    AppsClientTestAccess::addRestoringPlaceholder(client, "com.c");
+  }
+  auto lines = device.log().lines();
+  ASSERT_EQ(lines.size(), 2u);
+  EXPECT_EQ(lines[0].message, "com.vantor.trc.AppSync|" + name +
+                                  " getting dealloc'd with 2 outstanding PFT transfers!");
+  EXPECT_EQ(lines[1].message, "com.vantor.trc.AppSync|" + name +
+                                  " getting dealloc'd with (com.c)pending placeholder install "
+                                  "complete notifications");
+  for (const auto& line : lines) {
+    EXPECT_EQ(line.level, LogLevel::Error);
+    EXPECT_EQ(line.category, 8);
+  }
+
+  // Without unfinished work, nothing is said.
+  device.log().clear();
+  { AppsClient client(device.platform()); }
+  EXPECT_TRUE(device.log().lines().empty());
 }
 
 TEST(AppsClientTest, OutsideTheHostDaemonNoStartupHandshakeHappens) {
@@ -77,9 +259,8 @@ TEST(AppsClientTest, StartupCallbackWithoutObserverDoesNothing) {
   testing::TempDir root;
   FakePlatform device(root.path(), insideHostDaemon());
   AppsClient client(device.platform());
-  AppsClient::_handleTRCStartupCompletedNotification(nullptr, nullptr,
-                                                     "com.vantor.trc.TRStartupCompleteNotification",
-                                                     nullptr, nullptr);
+  AppsClient::_handleTRCStartupCompletedNotification(
+      nullptr, nullptr, "com.vantor.trc.TRStartupCompleteNotification", nullptr, nullptr);
   EXPECT_FALSE(client.hasInstallCoordinatorObserver());
   AppsClient::_handleTRCStartupCompletedNotification(nullptr, &client, "", nullptr, nullptr);
   EXPECT_TRUE(client.hasInstallCoordinatorObserver());
@@ -126,14 +307,128 @@ TEST(AppsClientTest, InstallAttemptCounterLosesNoIncrement) {
   EXPECT_EQ(collected, static_cast<std::uint64_t>(kThreads * kPerThread));
 }
 
-TEST(AppsClientDeathTest, UnimplementedOptionalOperationsAbortWithTheirName) {
+// Calls one optional operation with throwaway arguments.
+void call(AppsClient& c, TRClientOperation operation) {
+  using Op = TRClientOperation;
+  auto asset = TRAsset::downloadAssetWithIdentifier("com.a", "Application", "A");
+  std::vector<std::string> paths;
+  switch (operation) {
+    case Op::currentSyncAnchor:
+      c.currentSyncAnchor();
+      return;
+    case Op::prepareForSyncWithHostAnchor:
+      c.prepareForSyncWithHostAnchor("a", nullptr, nullptr);
+      return;
+    case Op::prepareForSyncWithHostAnchorHostAuthIdentifierHostVersion:
+      c.prepareForSyncWithHostAnchor("a", 1, "v", nullptr, nullptr);
+      return;
+    case Op::reconcileSync:
+      c.reconcileSync(0, "a", nullptr, nullptr);
+      return;
+    case Op::syncEndedWithSuccess:
+      c.syncEndedWithSuccess(false);
+      return;
+    case Op::reconcileRestoreOfType:
+      c.reconcileRestoreOfType(0, nullptr);
+      return;
+    case Op::reconcileRestoreWithError:
+      c.reconcileRestoreWithError(nullptr);
+      return;
+    case Op::restoreEndedWithError:
+      c.restoreEndedWithError(nullptr);
+      return;
+    case Op::cancelSyncOperations:
+      c.cancelSyncOperations();
+      return;
+    case Op::registerMessageHandlersWithLink:
+      c.registerMessageHandlersWithLink(nullptr);
+      return;
+    case Op::installedAssets:
+      c.installedAssets();
+      return;
+    case Op::outstandingAssetTransfers:
+      c.outstandingAssetTransfers();
+      return;
+    case Op::outstandingAssetTransfersWithDownloadManager:
+      c.outstandingAssetTransfersWithDownloadManager(nullptr);
+      return;
+    case Op::assetTransferSucceeded:
+      c.assetTransfer(asset, false, nullptr);
+      return;
+    case Op::assetTransferUpdatedProgress:
+      c.assetTransfer(asset, 0.5);
+      return;
+    case Op::assetTransferEndedWithSuccess:
+      c.assetTransferEndedWithSuccess(false);
+      return;
+    case Op::assetInstallSucceeded:
+      c.assetInstallSucceeded(asset);
+      return;
+    case Op::assetInstallFailed:
+      c.assetInstallFailed(asset, nullptr);
+      return;
+    case Op::metadataUpdate:
+      c.metadataUpdate({}, asset, "a");
+      return;
+    case Op::prioritizeAsset:
+      c.prioritizeAsset(asset);
+      return;
+    case Op::initiateAssetDownloadsWithCompletion:
+      c.initiateAssetDownloadsWithCompletion(nullptr);
+      return;
+    case Op::clearSyncData:
+      c.clearSyncData();
+      return;
+    case Op::installedAssetMetrics:
+      c.installedAssetMetrics();
+      return;
+    case Op::vantorIDsForAssets:
+      c.vantorIDsForAssets();
+      return;
+    case Op::accountsForAssets:
+      c.accountsForAssets();
+      return;
+    case Op::disabledAssetTypes:
+      c.disabledAssetTypes();
+      return;
+    case Op::prepareForBackup:
+      c.prepareForBackup();
+      return;
+    case Op::backupEnded:
+      c.backupEnded();
+      return;
+    case Op::pathsToBackup:
+      c.pathsToBackup(&paths, &paths);
+      return;
+    case Op::shouldRestoreFile:
+      c.shouldRestoreFile("/x", nullptr);
+      return;
+    case Op::shouldBackgroundRestorePath:
+      c.shouldBackgroundRestorePath("/x", nullptr);
+      return;
+    case Op::shouldBackgroundRestoreFile:
+      c.shouldBackgroundRestoreFile("/x", nullptr);
+      return;
+  }
+}
+
+TEST(AppsClientDeathTest, RespondsToExactlyTheOperationsItImplements) {
+  // An operation the client does not claim must abort with its name when called anyway; one it
+  // claims must not. Adding an operation without claiming it, or the other way round, fails.
   GTEST_FLAG_SET(death_test_style, "threadsafe");
   testing::TempDir root;
   FakePlatform device(root.path());
   AppsClient client(device.platform());
-  EXPECT_FALSE(client.respondsTo(TRClientOperation::backupEnded));
-  EXPECT_FALSE(client.respondsTo(TRClientOperation::cancelSyncOperations));
-  EXPECT_DEATH(client.backupEnded(), "backupEnded is not implemented by this client");
+  for (int i = 0; i <= static_cast<int>(TRClientOperation::shouldBackgroundRestoreFile); ++i) {
+    const auto operation = static_cast<TRClientOperation>(i);
+    SCOPED_TRACE(operationName(operation));
+    if (client.respondsTo(operation)) {
+      call(client, operation);
+    } else {
+      EXPECT_DEATH(call(client, operation),
+                   std::string(operationName(operation)) + " is not implemented by this client");
+    }
+  }
 }
 
 }  // namespace
