@@ -204,43 +204,12 @@ std::uint64_t FakeKCAppInstallCoordinator::appAssetPromiseResponsibleClientWithE
   return snapshot().responsibleClient;
 }
 
-FakeKCAppInstallCoordinator::Snapshot FakeKCAppInstallCoordinator::snapshot() const {
-  return state_.get();
-}
-FakeKCAppInstallCoordinator::State FakeKCAppInstallCoordinator::state() const {
-  return snapshot().state;
-}
-ErrorRef FakeKCAppInstallCoordinator::error() const { return snapshot().error; }
-KCAppInstallObserverDelegate* FakeKCAppInstallCoordinator::observer() const {
-  return snapshot().observer;
-}
-bool FakeKCAppInstallCoordinator::hasPlaceholderPromise() const {
-  return snapshot().placeholder != nullptr;
-}
-bool FakeKCAppInstallCoordinator::hasAppAssetPromise() const {
-  return snapshot().appAssetPromise != nullptr;
-}
-bool FakeKCAppInstallCoordinator::hasUserDataPromise() const {
-  return snapshot().userDataPromise != nullptr;
-}
-bool FakeKCAppInstallCoordinator::hasInstallOptions() const {
-  return snapshot().installOptions != nullptr;
-}
-bool FakeKCAppInstallCoordinator::hasInitialSPRAssetPromises() const {
-  return snapshot().hasSPRPromises;
-}
-
 std::string FakeKCAppInstallCoordinator::describe() const {
   return "<" + std::string(coordinatorClassName(kind_)) +
          " bundleID=" + fake_kc::oneLine(bundleID_) + " creator=" + std::to_string(creator_) + ">";
 }
 
 // --- Service side ------------------------------------------------------------------------------
-
-void FakeKCAppInstallCoordinator::notePlaceholderRecord() { placedPlaceholderRecord_.set(true); }
-bool FakeKCAppInstallCoordinator::placedPlaceholderRecord() const {
-  return placedPlaceholderRecord_.get();
-}
 
 bool FakeKCAppInstallCoordinator::markPlaceholderInstalled() {
   return state_.with([](Snapshot& s) {

@@ -35,7 +35,7 @@ class FakeKCAppInstallCoordinator final
 
   std::string bundleID() const override { return bundleID_; }
   KCCoordinatorKind kind() const override { return kind_; }
-  ErrorRef error() const override;
+  ErrorRef error() const override { return snapshot().error; }
   std::uint64_t creatorIdentifier() const override { return creator_; }
   // Sets error() to the reason (kKCErrorCanceled when none), cancels the promises and the
   // placeholder, and has the service forget the coordinator and report the cancellation.
@@ -49,20 +49,20 @@ class FakeKCAppInstallCoordinator final
   // kKCErrorInvalidState when it is cancelled or already belongs to a coordinator.
   bool setPlaceholderPromise(const std::shared_ptr<KCPlaceholder>& placeholder,
                              ErrorRef* error) override;
-  bool hasPlaceholderPromise() const override;
+  bool hasPlaceholderPromise() const override { return snapshot().placeholder != nullptr; }
   bool setAppAssetPromise(const std::shared_ptr<KCPromisedTransferToPath>& promise,
                           ErrorRef* error) override;
   // Null, with no error, when the coordinator has no asset promise.
   std::shared_ptr<KCPromisedTransferToPath> appAssetPromiseWithError(ErrorRef* error) override;
-  bool hasAppAssetPromise() const override;
+  bool hasAppAssetPromise() const override { return snapshot().appAssetPromise != nullptr; }
   bool setUserDataPromise(const std::shared_ptr<KCPromise>& promise, ErrorRef* error) override;
-  bool hasUserDataPromise() const override;
+  bool hasUserDataPromise() const override { return snapshot().userDataPromise != nullptr; }
   bool setInstallOptions(const std::shared_ptr<const EMInstallOptions>& options,
                          ErrorRef* error) override;
-  bool hasInstallOptions() const override;
+  bool hasInstallOptions() const override { return snapshot().installOptions != nullptr; }
   bool setInitialSPRAssetPromises(const std::vector<std::shared_ptr<KCPromise>>& promises,
                                   ErrorRef* error) override;
-  bool hasInitialSPRAssetPromises() const override;
+  bool hasInitialSPRAssetPromises() const override { return snapshot().hasSPRPromises; }
   // May be changed at any time while the coordinator is active.
   bool setAppAssetPromiseResponsibleClient(std::uint64_t client, ErrorRef* error) override;
   // 0 when no client was named.
@@ -83,14 +83,14 @@ class FakeKCAppInstallCoordinator final
     std::uint64_t responsibleClient = 0;
     bool placeholderInstalled = false;
   };
-  Snapshot snapshot() const;
-  State state() const;
-  KCAppInstallObserverDelegate* observer() const;
+  Snapshot snapshot() const { return state_.get(); }
+  State state() const { return snapshot().state; }
+  KCAppInstallObserverDelegate* observer() const { return snapshot().observer; }
 
   // Service side.
   // Records that the service put a placeholder record for this coordinator into the registry.
-  void notePlaceholderRecord();
-  bool placedPlaceholderRecord() const;
+  void notePlaceholderRecord() { placedPlaceholderRecord_.set(true); }
+  bool placedPlaceholderRecord() const { return placedPlaceholderRecord_.get(); }
   // Active → placeholder installed; false when no longer active.
   bool markPlaceholderInstalled();
   // Active → Completed with `error` (null on success); false when no longer active.

@@ -111,22 +111,6 @@ std::string FakeKCPlaceholder::describe() const {
          ">";
 }
 
-std::shared_ptr<KCPromisedTransferToPath> FakeKCPlaceholder::iconPromise() const {
-  return state_.get().iconPromise;
-}
-std::optional<KCPlaceholderAttributes> FakeKCPlaceholder::attributes() const {
-  return state_.get().attributes;
-}
-std::shared_ptr<const EMStoreMetadata> FakeKCPlaceholder::metadata() const {
-  return state_.get().metadata;
-}
-std::optional<plist::Bytes> FakeKCPlaceholder::sinfData() const { return state_.get().sinf; }
-bool FakeKCPlaceholder::isConfigurationComplete() const {
-  return state_.get().configurationComplete;
-}
-bool FakeKCPlaceholder::isCancelled() const { return state_.get().cancelled; }
-ErrorRef FakeKCPlaceholder::cancelReason() const { return state_.get().cancelReason; }
-
 bool FakeKCPlaceholder::isReadyToInstall() const {
   State s = state_.get();
   if (!s.configurationComplete || s.cancelled) return false;

@@ -43,13 +43,13 @@ class FakeKCPlaceholder final : public KCPlaceholder {
   const std::string& bundleName() const { return bundleName_; }
   std::uint64_t installType() const { return installType_; }
   std::uint64_t client() const { return client_; }
-  std::shared_ptr<KCPromisedTransferToPath> iconPromise() const;
-  std::optional<KCPlaceholderAttributes> attributes() const;
-  std::shared_ptr<const EMStoreMetadata> metadata() const;
-  std::optional<plist::Bytes> sinfData() const;
-  bool isConfigurationComplete() const;
-  bool isCancelled() const;
-  ErrorRef cancelReason() const;
+  std::shared_ptr<KCPromisedTransferToPath> iconPromise() const { return state_.get().iconPromise; }
+  std::optional<KCPlaceholderAttributes> attributes() const { return state_.get().attributes; }
+  std::shared_ptr<const EMStoreMetadata> metadata() const { return state_.get().metadata; }
+  std::optional<plist::Bytes> sinfData() const { return state_.get().sinf; }
+  bool isConfigurationComplete() const { return state_.get().configurationComplete; }
+  bool isCancelled() const { return state_.get().cancelled; }
+  ErrorRef cancelReason() const { return state_.get().cancelReason; }
 
   // Configured, not cancelled, and its icon promise (if any) fulfilled.
   bool isReadyToInstall() const;

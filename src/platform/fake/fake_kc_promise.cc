@@ -27,12 +27,6 @@ FakeKCPromiseBase::FakeKCPromiseBase(std::weak_ptr<FakeKCServiceHooks> service,
       identifier_(identifier),
       state_(State{.transferPath = std::move(transferPath)}) {}
 
-ErrorRef FakeKCPromiseBase::cancelReason() const { return state_.get().cancelReason; }
-double FakeKCPromiseBase::percent() const { return state_.get().percent; }
-bool FakeKCPromiseBase::complete() const { return state_.get().complete; }
-bool FakeKCPromiseBase::cancelled() const { return state_.get().cancelled; }
-std::optional<std::string> FakeKCPromiseBase::path() const { return state_.get().transferPath; }
-
 bool FakeKCPromiseBase::isFulfilled() const {
   State s = state_.get();
   return s.complete && !s.cancelled;

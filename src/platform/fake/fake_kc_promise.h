@@ -23,7 +23,7 @@ class FakeKCPromiseBase {
 
   // The number promiseDidBeginFulfillmentWithIdentifier: reports for this promise.
   std::uint64_t uniqueIdentifier() const { return identifier_; }
-  ErrorRef cancelReason() const;
+  ErrorRef cancelReason() const { return state_.get().cancelReason; }
   // Complete and not cancelled.
   bool isFulfilled() const;
   // Completion and path changes are reported to `coordinator` from now on.
@@ -37,13 +37,13 @@ class FakeKCPromiseBase {
                     std::optional<std::string> transferPath, std::uint64_t diskSpaceNeeded,
                     std::uint64_t identifier);
 
-  double percent() const;
+  double percent() const { return state_.get().percent; }
   void setPercent(double fraction);
-  bool complete() const;
+  bool complete() const { return state_.get().complete; }
   void setCompleteFlag(bool complete);
-  bool cancelled() const;
+  bool cancelled() const { return state_.get().cancelled; }
   bool cancel(const ErrorRef& reason, ErrorRef* error);
-  std::optional<std::string> path() const;
+  std::optional<std::string> path() const { return state_.get().transferPath; }
   void setPath(std::string path);
   std::string describeState() const;
 
