@@ -12,6 +12,7 @@
 #include <vector>
 
 #include "runtime/error.h"
+#include "runtime/guarded.h"
 #include "runtime/plist/value.h"
 
 namespace appsync {
@@ -79,13 +80,12 @@ class ARInstallProgress {
   std::string describe() const;
 
  private:
-  mutable std::mutex mutex_;
-  std::string identifier_;
-  std::uint64_t state_ = ARInstallStateWaiting;
-  std::uint64_t phase_ = ARInstallPhaseLoading;
-  std::int64_t total_ = 0;
-  std::int64_t completed_ = 0;
-  bool cancelled_ = false;
+  const std::string identifier_;
+  Guarded<std::uint64_t> state_{ARInstallStateWaiting};
+  Guarded<std::uint64_t> phase_{ARInstallPhaseLoading};
+  Guarded<std::int64_t> total_;
+  Guarded<std::int64_t> completed_;
+  Guarded<bool> cancelled_;
 };
 
 struct ARAppState {

@@ -26,146 +26,47 @@ TRAsset::TRAsset(std::string identifier, std::string dataclass,
       prettyName_(std::move(prettyName)),
       isDownload_(isDownload) {}
 
-std::string TRAsset::identifier() const {
-  std::lock_guard lock(mutex_);
-  return identifier_;
-}
+std::string TRAsset::identifier() const { return identifier_; }
+std::string TRAsset::dataclass() const { return dataclass_; }
+std::optional<std::string> TRAsset::prettyName() const { return prettyName_; }
 
-std::string TRAsset::dataclass() const {
-  std::lock_guard lock(mutex_);
-  return dataclass_;
-}
+plist::Dict TRAsset::variantOptions() const { return variantOptions_.get(); }
+void TRAsset::setVariantOptions(plist::Dict options) { variantOptions_.set(std::move(options)); }
+std::optional<std::string> TRAsset::infoPlist() const { return infoPlist_.get(); }
+void TRAsset::setInfoPlist(std::optional<std::string> path) { infoPlist_.set(std::move(path)); }
+std::optional<std::string> TRAsset::storePlist() const { return storePlist_.get(); }
+void TRAsset::setStorePlist(std::optional<std::string> path) { storePlist_.set(std::move(path)); }
+std::optional<std::string> TRAsset::icon() const { return icon_.get(); }
+void TRAsset::setIcon(std::optional<std::string> path) { icon_.set(std::move(path)); }
+std::optional<std::string> TRAsset::path() const { return path_.get(); }
+void TRAsset::setPath(std::optional<std::string> path) { path_.set(std::move(path)); }
 
-std::optional<std::string> TRAsset::prettyName() const {
-  std::lock_guard lock(mutex_);
-  return prettyName_;
-}
-
-plist::Dict TRAsset::variantOptions() const {
-  std::lock_guard lock(mutex_);
-  return variantOptions_;
-}
-
-void TRAsset::setVariantOptions(plist::Dict options) {
-  std::lock_guard lock(mutex_);
-  variantOptions_ = std::move(options);
-}
-
-std::optional<std::string> TRAsset::infoPlist() const {
-  std::lock_guard lock(mutex_);
-  return infoPlist_;
-}
-
-void TRAsset::setInfoPlist(std::optional<std::string> path) {
-  std::lock_guard lock(mutex_);
-  infoPlist_ = std::move(path);
-}
-
-std::optional<std::string> TRAsset::storePlist() const {
-  std::lock_guard lock(mutex_);
-  return storePlist_;
-}
-
-void TRAsset::setStorePlist(std::optional<std::string> path) {
-  std::lock_guard lock(mutex_);
-  storePlist_ = std::move(path);
-}
-
-std::optional<std::string> TRAsset::icon() const {
-  std::lock_guard lock(mutex_);
-  return icon_;
-}
-
-void TRAsset::setIcon(std::optional<std::string> path) {
-  std::lock_guard lock(mutex_);
-  icon_ = std::move(path);
-}
-
-std::optional<std::string> TRAsset::path() const {
-  std::lock_guard lock(mutex_);
-  return path_;
-}
-
-void TRAsset::setPath(std::optional<std::string> path) {
-  std::lock_guard lock(mutex_);
-  path_ = std::move(path);
-}
-
-bool TRAsset::isRestore() const {
-  std::lock_guard lock(mutex_);
-  return isRestore_;
-}
-
-void TRAsset::setIsRestore(bool restore) {
-  std::lock_guard lock(mutex_);
-  isRestore_ = restore;
-}
-
-bool TRAsset::isDownload() const {
-  std::lock_guard lock(mutex_);
-  return isDownload_;
-}
-
-void TRAsset::setIsDownload(bool download) {
-  std::lock_guard lock(mutex_);
-  isDownload_ = download;
-}
-
-std::uint64_t TRAsset::completedAssetParts() const {
-  std::lock_guard lock(mutex_);
-  return completedAssetParts_;
-}
-
-void TRAsset::setCompletedAssetParts(std::uint64_t parts) {
-  std::lock_guard lock(mutex_);
-  completedAssetParts_ = parts;
-}
-
-std::int64_t TRAsset::storePID() const {
-  std::lock_guard lock(mutex_);
-  return storePID_;
-}
-
-void TRAsset::setStorePID(std::int64_t pid) {
-  std::lock_guard lock(mutex_);
-  storePID_ = pid;
-}
-
-float TRAsset::downloadProgress() const {
-  std::lock_guard lock(mutex_);
-  return downloadProgress_;
-}
-
-void TRAsset::setDownloadProgress(float progress) {
-  std::lock_guard lock(mutex_);
-  downloadProgress_ = progress;
-}
-
-float TRAsset::installProgress() const {
-  std::lock_guard lock(mutex_);
-  return installProgress_;
-}
-
-void TRAsset::setInstallProgress(float progress) {
-  std::lock_guard lock(mutex_);
-  installProgress_ = progress;
-}
+bool TRAsset::isRestore() const { return isRestore_.get(); }
+void TRAsset::setIsRestore(bool restore) { isRestore_.set(restore); }
+bool TRAsset::isDownload() const { return isDownload_.get(); }
+void TRAsset::setIsDownload(bool download) { isDownload_.set(download); }
+std::uint64_t TRAsset::completedAssetParts() const { return completedAssetParts_.get(); }
+void TRAsset::setCompletedAssetParts(std::uint64_t parts) { completedAssetParts_.set(parts); }
+std::int64_t TRAsset::storePID() const { return storePID_.get(); }
+void TRAsset::setStorePID(std::int64_t pid) { storePID_.set(pid); }
+float TRAsset::downloadProgress() const { return downloadProgress_.get(); }
+void TRAsset::setDownloadProgress(float progress) { downloadProgress_.set(progress); }
+float TRAsset::installProgress() const { return installProgress_.get(); }
+void TRAsset::setInstallProgress(float progress) { installProgress_.set(progress); }
 
 std::string TRAsset::shortDescription() const {
-  std::lock_guard lock(mutex_);
   return "<TRAsset " + dataclass_ + " " + identifier_ + ">";
 }
 
 std::string TRAsset::describe() const {
-  std::lock_guard lock(mutex_);
   std::string out = "<TRAsset " + dataclass_ + " " + identifier_;
   out += " prettyName=" + describeOptional(prettyName_);
-  out += std::string(" download=") + (isDownload_ ? "1" : "0");
-  out += std::string(" restore=") + (isRestore_ ? "1" : "0");
-  out += " parts=" + std::to_string(completedAssetParts_);
-  out += " storePID=" + std::to_string(storePID_);
-  out += " path=" + describeOptional(path_);
-  out += " variantOptions=" + plist::Value(variantOptions_).describe();
+  out += std::string(" download=") + (isDownload() ? "1" : "0");
+  out += std::string(" restore=") + (isRestore() ? "1" : "0");
+  out += " parts=" + std::to_string(completedAssetParts());
+  out += " storePID=" + std::to_string(storePID());
+  out += " path=" + describeOptional(path());
+  out += " variantOptions=" + plist::Value(variantOptions()).describe();
   out += ">";
   return out;
 }

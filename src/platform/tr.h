@@ -11,6 +11,7 @@
 #include <string_view>
 
 #include "runtime/error.h"
+#include "runtime/guarded.h"
 #include "runtime/log/log.h"
 #include "runtime/plist/value.h"
 
@@ -78,17 +79,16 @@ class TRAsset {
   std::string describe() const;
 
  private:
-  mutable std::mutex mutex_;
-  std::string identifier_;
-  std::string dataclass_;
-  std::optional<std::string> prettyName_;
-  plist::Dict variantOptions_;
-  std::optional<std::string> infoPlist_, storePlist_, icon_, path_;
-  bool isRestore_ = false;
-  bool isDownload_ = true;
-  std::uint64_t completedAssetParts_ = 0;
-  std::int64_t storePID_ = 0;
-  float downloadProgress_ = 0, installProgress_ = 0;
+  const std::string identifier_;
+  const std::string dataclass_;
+  const std::optional<std::string> prettyName_;
+  Guarded<plist::Dict> variantOptions_;
+  Guarded<std::optional<std::string>> infoPlist_, storePlist_, icon_, path_;
+  Guarded<bool> isRestore_;
+  Guarded<bool> isDownload_;
+  Guarded<std::uint64_t> completedAssetParts_;
+  Guarded<std::int64_t> storePID_;
+  Guarded<float> downloadProgress_, installProgress_;
 };
 
 // One store account, as reported to the host.

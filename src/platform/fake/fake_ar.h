@@ -11,6 +11,7 @@
 #include <mutex>
 #include <optional>
 #include <string>
+#include <string_view>
 #include <utility>
 #include <vector>
 
@@ -152,6 +153,18 @@ class FakeARWorkspace final : public ARApplicationWorkspace, public FakeService 
       const std::string& identifier, bool placeholder) override;
 
  private:
+  // Operation names (see above).
+  static constexpr std::string_view kIsInstalled = "applicationIsInstalled:";
+  static constexpr std::string_view kUninstall = "uninstallApplication:withOptions:";
+  static constexpr std::string_view kInstallPlaceholder = "installApplication:withOptions:";
+  static constexpr std::string_view kInstallPackage = "installApplication:withOptions:error:";
+  static constexpr std::string_view kEnumerate = "enumerateBundlesOfType:block:";
+  static constexpr std::string_view kProgress = "installProgressForApplication:withPhase:";
+  static constexpr std::string_view kProxy = "applicationProxyForIdentifier:placeholder:";
+  static constexpr std::string_view kAddObserver = "addObserver:";
+  static constexpr std::string_view kRemoveObserver = "removeObserver:";
+  static constexpr std::string_view kPhaseFinished = "installPhaseFinishedForProgress:";
+
   struct Entry {
     AppRecord record;
     std::shared_ptr<ARInstallProgress> currentProgress;

@@ -1,16 +1,11 @@
-// The fake install-coordination service: coordinator bookkeeping, the background installs of
-// placeholders and packages, and event delivery on the service's own thread.
+// The fake install-coordination service's face: the calls of its clients and tests, each
+// counted and scriptable, handed on to the daemon that does the work.
 #include "platform/fake/fake_kc.h"
 
-#include <map>
-#include <mutex>
 #include <string_view>
 #include <utility>
 
-#include "platform/ar.h"
-#include "platform/bundle_keys.h"
-#include "platform/fake/callback_thread.h"
-#include "platform/fake/fake_ar.h"
+#include "platform/fake/fake_kc_daemon.h"
 
 namespace appsync {
 namespace {
@@ -28,349 +23,8 @@ constexpr std::string_view kInitTransferOp =
 constexpr std::string_view kInitOutOfBandOp =
     "KCPromisedOutOfBandTransfer initWithName:client:diskSpaceNeeded:";
 constexpr std::string_view kInitObserverOp = "initWithMachServiceName:forClients:delegate:";
-constexpr std::string_view kInstallPlaceholderOp = "installPlaceholder";
-constexpr std::string_view kInstallPackageOp = "installPackage";
-
-// The client number the service itself reports for cancellations it makes.
-constexpr std::uint64_t kServiceClient = 0;
-
-std::string pathFromTransferPath(const std::string& path) {
-  constexpr std::string_view kScheme = "file://";
-  if (path.compare(0, kScheme.size(), kScheme) == 0) return path.substr(kScheme.size());
-  return path;
-}
-
-// A promise that gates an install: present means it must be complete and not cancelled.
-bool settled(const std::shared_ptr<KCPromise>& promise) {
-  return !promise || (promise->isComplete() && !promise->isCancelled());
-}
 
 }  // namespace
-
-class FakeKCInstallCoordination::Core final : public FakeKCServiceHooks,
-                                              public std::enable_shared_from_this<Core> {
- public:
-  using Coordinator = FakeKCAppInstallCoordinator;
-  using CoordinatorRef = std::shared_ptr<Coordinator>;
-
-  Core(FakeKCInstallCoordination& owner, FakeARWorkspace& registry)
-      : registry_(registry),
-        owner_(&owner),
-        events_(std::make_shared<CallbackThread>("fake-kc-events")) {}
-  ~Core() { shutdown(); }
-
-  // Stops counting calls and delivering anything; work still queued is dropped.
-  void shutdown() {
-    std::shared_ptr<CallbackThread> events;
-    {
-      std::lock_guard lock(mutex_);
-      stopped_ = true;
-      owner_ = nullptr;
-      events = std::move(events_);
-    }
-    // Runs out the queue (each item returns at once, seeing stopped_) and joins the thread.
-    events.reset();
-  }
-
-  std::weak_ptr<FakeKCServiceHooks> hooks() { return weak_from_this(); }
-
-  // --- FakeKCServiceHooks ---
-
-  ErrorRef scriptedFailure(std::string_view operation) override {
-    std::lock_guard lock(mutex_);
-    return owner_ ? owner_->beginCall(operation) : nullptr;
-  }
-
-  void coordinatorChanged(const CoordinatorRef& c) override {
-    post([this, c] { evaluate(c); });
-  }
-
-  void coordinatorCancelled(const CoordinatorRef& c, const ErrorRef& reason,
-                            std::uint64_t client) override {
-    forget(c);
-    post([this, c, reason, client] { reportCancellation(c, reason, client); });
-  }
-
-  void observerReplaced() override { waitForRunningDelivery(); }
-
-  void registrationGone(const FakeKCAppInstallObserver* registration) override {
-    {
-      std::lock_guard lock(mutex_);
-      std::erase(registrations_, registration);
-    }
-    waitForRunningDelivery();
-  }
-
-  // --- Service state ---
-
-  bool enabled() const {
-    std::lock_guard lock(mutex_);
-    return enabled_;
-  }
-  void setEnabled(bool enabled) {
-    std::lock_guard lock(mutex_);
-    enabled_ = enabled;
-  }
-
-  // The existing coordinator (kind permitting) or a new one; see coordinatorForAppWithBundleID.
-  CoordinatorRef findOrCreate(KCCoordinatorKind kind, const std::string& bundleID,
-                              std::uint64_t clientID, bool create, bool* created, ErrorRef* error) {
-    std::lock_guard lock(mutex_);
-    setError(error, nullptr);
-    if (auto it = coordinators_.find(bundleID); it != coordinators_.end()) {
-      const CoordinatorRef& existing = it->second;
-      if (kind == KCCoordinatorKind::Any || existing->kind() == kind) return existing;
-      setError(error, makeKCError(kKCErrorCoordinatorKindMismatch,
-                                  "a " + std::string(coordinatorClassName(existing->kind())) +
-                                      " already exists for " + bundleID));
-      return nullptr;
-    }
-    if (!create || kind == KCCoordinatorKind::Any) return nullptr;
-    if (created) *created = true;
-    return makeLocked(kind, bundleID, clientID);
-  }
-
-  CoordinatorRef put(KCCoordinatorKind kind, const std::string& bundleID, std::uint64_t creator) {
-    std::lock_guard lock(mutex_);
-    return makeLocked(kind, bundleID, creator);
-  }
-
-  CoordinatorRef find(const std::string& bundleID) const {
-    std::lock_guard lock(mutex_);
-    auto it = coordinators_.find(bundleID);
-    return it == coordinators_.end() ? nullptr : it->second;
-  }
-
-  std::vector<CoordinatorRef> all() const {
-    std::lock_guard lock(mutex_);
-    std::vector<CoordinatorRef> out;
-    for (const auto& [id, c] : coordinators_) out.push_back(c);
-    return out;
-  }
-
-  std::uint64_t nextPromiseIdentifier() {
-    std::lock_guard lock(mutex_);
-    return nextPromiseIdentifier_++;
-  }
-
-  void addRegistration(const FakeKCAppInstallObserver* registration) {
-    std::lock_guard lock(mutex_);
-    registrations_.push_back(registration);
-  }
-
-  void removeObserverEverywhere(const KCAppInstallObserverDelegate* observer) {
-    std::vector<CoordinatorRef> made;
-    {
-      std::lock_guard lock(mutex_);
-      for (const auto& weak : made_) {
-        if (auto c = weak.lock()) made.push_back(std::move(c));
-      }
-    }
-    for (const auto& c : made) c->forgetObserver(observer);
-    waitForRunningDelivery();
-  }
-
-  // --- The event thread ---
-
-  void post(std::function<void()> work) {
-    std::lock_guard lock(mutex_);
-    if (stopped_ || !events_) return;
-    events_->post([this, work = std::move(work)] {
-      if (stopped()) return;
-      const Core* previous = current_;
-      current_ = this;
-      work();
-      current_ = previous;
-    });
-  }
-
-  void drain() {
-    std::shared_ptr<CallbackThread> events = thread();
-    if (!events) return;
-    // Work done on the thread may queue more (an observer calling back into the service).
-    do {
-      if (events->isHeld()) {
-        events->waitUntilIdle();
-        return;
-      }
-      events->drain();
-    } while (events->pendingCount() > 0);
-  }
-
-  void hold() {
-    std::lock_guard lock(mutex_);
-    if (events_) events_->hold();
-  }
-
-  void release() {
-    std::lock_guard lock(mutex_);
-    if (events_) events_->release();
-  }
-
-  using DelegateCall = std::function<void(KCAppInstallObserverDelegate&)>;
-
-  // Calls `call` on the coordinator's observer, then on the delegates registered for its
-  // creator. Runs on the event thread, with no lock held during the calls.
-  void deliver(const Coordinator& c, const DelegateCall& call) {
-    std::vector<KCAppInstallObserverDelegate*> targets;
-    if (KCAppInstallObserverDelegate* observer = c.observer()) targets.push_back(observer);
-    {
-      std::lock_guard lock(mutex_);
-      for (const FakeKCAppInstallObserver* r : registrations_) {
-        if (r->delegate() && r->clients().count(c.creatorIdentifier())) {
-          targets.push_back(r->delegate());
-        }
-      }
-    }
-    for (KCAppInstallObserverDelegate* target : targets) call(*target);
-  }
-
-  ErrorRef uninstall(const std::string& bundleID) {
-    if (!registry_.application(bundleID)) {
-      return makeKCError(kKCErrorUnknownApplication, "no application " + bundleID);
-    }
-    if (!registry_.uninstallApplication(bundleID, std::nullopt)) {
-      return makeKCError(kKCErrorUninstallFailed, "the registry did not remove " + bundleID);
-    }
-    return nullptr;
-  }
-
- private:
-  CoordinatorRef makeLocked(KCCoordinatorKind kind, const std::string& bundleID,
-                            std::uint64_t creator) {
-    auto c = std::make_shared<Coordinator>(hooks(), kind, bundleID, creator);
-    coordinators_[bundleID] = c;
-    std::erase_if(made_, [](const std::weak_ptr<Coordinator>& w) { return w.expired(); });
-    made_.push_back(c);
-    return c;
-  }
-
-  void forget(const CoordinatorRef& c) {
-    std::lock_guard lock(mutex_);
-    auto it = coordinators_.find(c->bundleID());
-    if (it != coordinators_.end() && it->second == c) coordinators_.erase(it);
-  }
-
-  bool stopped() const {
-    std::lock_guard lock(mutex_);
-    return stopped_;
-  }
-
-  std::shared_ptr<CallbackThread> thread() const {
-    std::lock_guard lock(mutex_);
-    return events_;
-  }
-
-  // Returns once no delivery that may have read an old observer is running. Inside a delivery
-  // the running one is the caller's own.
-  void waitForRunningDelivery() {
-    if (current_ == this) return;
-    if (std::shared_ptr<CallbackThread> events = thread()) events->waitUntilIdle();
-  }
-
-  // Moves the coordinator as far as its promises allow: placeholder, then package.
-  void evaluate(const CoordinatorRef& c) {
-    Coordinator::Snapshot s = c->snapshot();
-    if (s.state != Coordinator::State::Active) return;
-    auto* placeholder = dynamic_cast<FakeKCPlaceholder*>(s.placeholder.get());
-    if (!placeholder) return;
-    if (!s.placeholderInstalled) {
-      if (!placeholder->isReadyToInstall()) return;
-      if (ErrorRef failure = scriptedFailure(kInstallPlaceholderOp)) {
-        if (c->markCancelled(failure)) {
-          forget(c);
-          reportCancellation(c, failure, kServiceClient);
-        }
-        return;
-      }
-      putPlaceholderRecord(*c, *placeholder);
-      if (!c->markPlaceholderInstalled()) return;
-      deliver(*c, [&](KCAppInstallObserverDelegate& d) { d.coordinatorDidInstallPlaceholder(c); });
-      s = c->snapshot();
-      if (s.state != Coordinator::State::Active) return;
-    }
-
-    if (!s.appAssetPromise || !settled(s.appAssetPromise) || !settled(s.userDataPromise)) return;
-    for (const auto& promise : s.sprPromises) {
-      if (!settled(promise)) return;
-    }
-    std::optional<std::string> transferPath = s.appAssetPromise->transferPath();
-    if (!transferPath || transferPath->empty()) return;
-
-    std::uint64_t installType =
-        s.installOptions ? s.installOptions->arInstallType() : placeholder->installType();
-    plist::Dict options{{std::string(ARPackageTypeKey), std::string(ARPackageTypeCustomer)},
-                        {std::string(kBNBundleIdentifierKey), c->bundleID()},
-                        {std::string(ARInstallTypeKey), installType}};
-    ErrorRef failure = scriptedFailure(kInstallPackageOp);
-    if (!failure) {
-      ErrorRef registryError;
-      if (!registry_.installApplication(pathFromTransferPath(*transferPath), options,
-                                        &registryError)) {
-        auto error = std::make_shared<Error>(*makeKCError(
-            kKCErrorInstallFailed, "the package of " + c->bundleID() + " could not be installed"));
-        error->underlying = registryError;
-        failure = error;
-      }
-    }
-    if (!c->finish(failure)) return;
-    forget(c);
-    deliver(*c, [&](KCAppInstallObserverDelegate& d) { d.coordinatorDidCompleteSuccessfully(c); });
-  }
-
-  void putPlaceholderRecord(Coordinator& c, const FakeKCPlaceholder& placeholder) {
-    std::optional<FakeARWorkspace::AppRecord> existing = registry_.application(c.bundleID());
-    if (existing && !existing->isPlaceholder) return;  // an update: the app stays as it is
-
-    FakeARWorkspace::AppRecord record;
-    record.identifier = c.bundleID();
-    record.name = placeholder.bundleName();
-    record.installType = placeholder.installType();
-    record.isPlaceholder = true;
-    if (std::optional<KCPlaceholderAttributes> attributes = placeholder.attributes()) {
-      record.version = attributes->bundleVersion();
-      if (!record.version) {
-        if (const std::string* v = plist::stringAt(attributes->infoPlist(), kBNBundleVersionKey)) {
-          record.version = *v;
-        }
-      }
-    }
-    if (auto icon = placeholder.iconPromise()) {
-      if (std::optional<std::string> path = icon->transferPath()) {
-        record.iconPath = pathFromTransferPath(*path);
-      }
-    }
-    registry_.putApplication(std::move(record));
-    c.notePlaceholderRecord();
-  }
-
-  void reportCancellation(const CoordinatorRef& c, const ErrorRef& reason, std::uint64_t client) {
-    if (c->placedPlaceholderRecord()) {
-      std::optional<FakeARWorkspace::AppRecord> record = registry_.application(c->bundleID());
-      if (record && record->isPlaceholder)
-        registry_.uninstallApplication(c->bundleID(), std::nullopt);
-    }
-    deliver(*c, [&](KCAppInstallObserverDelegate& d) { d.coordinator(c, reason, client); });
-  }
-
-  FakeARWorkspace& registry_;
-  static thread_local const Core* current_;  // the service whose item this thread runs
-
-  mutable std::mutex mutex_;
-  FakeKCInstallCoordination* owner_;  // null once shut down
-  bool stopped_ = false;
-  bool enabled_ = true;
-  std::map<std::string, CoordinatorRef> coordinators_;
-  std::vector<std::weak_ptr<Coordinator>> made_;  // every coordinator still alive
-  std::vector<const FakeKCAppInstallObserver*> registrations_;
-  std::uint64_t nextPromiseIdentifier_ = 1;
-  std::shared_ptr<CallbackThread> events_;
-};
-
-thread_local const FakeKCInstallCoordination::Core* FakeKCInstallCoordination::Core::current_ =
-    nullptr;
-
-// --- FakeKCInstallCoordination -----------------------------------------------------------------
 
 FakeKCInstallCoordination::FakeKCInstallCoordination(FakeARWorkspace& registry)
     : FakeService("FakeKCInstallCoordination", std::string(kKCErrorDomain),
@@ -401,16 +55,16 @@ FakeKCInstallCoordination::FakeKCInstallCoordination(FakeARWorkspace& registry)
                       {"KCAppInstallCoordinator cancelForReason:client:error:", true},
                       {"KCPlaceholder cancelForReason:client:error:", true},
                       {"KCPromise cancelForReason:client:error:", true},
-                      {kInstallPlaceholderOp, true},
-                      {kInstallPackageOp, true},
+                      {FakeKCDaemon::kInstallPlaceholderOp, true},
+                      {FakeKCDaemon::kInstallPackageOp, true},
                   }),
-      core_(std::make_shared<Core>(*this, registry)) {}
+      daemon_(std::make_shared<FakeKCDaemon>(*this, registry)) {}
 
-FakeKCInstallCoordination::~FakeKCInstallCoordination() { core_->shutdown(); }
+FakeKCInstallCoordination::~FakeKCInstallCoordination() { daemon_->shutdown(); }
 
 bool FakeKCInstallCoordination::coordinationIsEnabled() {
   beginCall("coordinationIsEnabled");
-  return core_->enabled();
+  return daemon_->enabled();
 }
 
 void FakeKCInstallCoordination::uninstallAppWithBundleID(const std::string& bundleID,
@@ -418,9 +72,9 @@ void FakeKCInstallCoordination::uninstallAppWithBundleID(const std::string& bund
                                                          std::function<void(ErrorRef)> completion) {
   (void)requestUserConfirmation;  // no user to ask
   ErrorRef failure = beginCall(kUninstallOp);
-  Core* core = core_.get();
-  core_->post([core, bundleID, failure, completion = std::move(completion)] {
-    ErrorRef result = failure ? failure : core->uninstall(bundleID);
+  FakeKCDaemon* daemon = daemon_.get();
+  daemon_->post([daemon, bundleID, failure, completion = std::move(completion)] {
+    ErrorRef result = failure ? failure : daemon->uninstall(bundleID);
     if (completion) completion(result);
   });
 }
@@ -433,14 +87,14 @@ std::shared_ptr<KCAppInstallCoordinator> FakeKCInstallCoordination::coordinatorF
     setError(error, failure);
     return nullptr;
   }
-  return core_->findOrCreate(kind, bundleID, clientID, createIfNotExisting, created, error);
+  return daemon_->findOrCreate(kind, bundleID, clientID, createIfNotExisting, created, error);
 }
 
 std::shared_ptr<KCPlaceholder> FakeKCInstallCoordination::initAppPlaceholder(
     const std::string& bundleName, const std::string& bundleID, std::uint64_t installType,
     std::uint64_t client) {
   if (beginCall(kInitPlaceholderOp)) return nullptr;
-  return std::make_shared<FakeKCPlaceholder>(core_->hooks(), bundleName, bundleID, installType,
+  return std::make_shared<FakeKCPlaceholder>(daemon_->hooks(), bundleName, bundleID, installType,
                                              client);
 }
 
@@ -448,8 +102,9 @@ std::shared_ptr<KCPromisedTransferToPath> FakeKCInstallCoordination::initPromise
     const std::string& name, std::uint64_t client, const std::optional<std::string>& transferPath,
     std::uint64_t diskSpaceNeeded) {
   if (beginCall(transferPath ? kInitTransferWithPathOp : kInitTransferOp)) return nullptr;
-  return std::make_shared<FakeKCPromisedTransferToPath>(
-      core_->hooks(), name, client, transferPath, diskSpaceNeeded, core_->nextPromiseIdentifier());
+  return std::make_shared<FakeKCPromisedTransferToPath>(daemon_->hooks(), name, client,
+                                                        transferPath, diskSpaceNeeded,
+                                                        daemon_->nextPromiseIdentifier());
 }
 
 std::shared_ptr<KCPromisedOutOfBandTransfer>
@@ -458,16 +113,16 @@ FakeKCInstallCoordination::initPromisedOutOfBandTransfer(const std::string& name
                                                          std::uint64_t diskSpaceNeeded) {
   if (beginCall(kInitOutOfBandOp)) return nullptr;
   return std::make_shared<FakeKCPromisedOutOfBandTransfer>(
-      core_->hooks(), name, client, diskSpaceNeeded, core_->nextPromiseIdentifier());
+      daemon_->hooks(), name, client, diskSpaceNeeded, daemon_->nextPromiseIdentifier());
 }
 
 std::shared_ptr<KCAppInstallObserver> FakeKCInstallCoordination::initAppInstallObserver(
     const std::string& machServiceName, const std::set<std::uint64_t>& clients,
     KCAppInstallObserverDelegate* delegate) {
   if (beginCall(kInitObserverOp)) return nullptr;
-  auto registration = std::make_shared<FakeKCAppInstallObserver>(core_->hooks(), machServiceName,
+  auto registration = std::make_shared<FakeKCAppInstallObserver>(daemon_->hooks(), machServiceName,
                                                                  clients, delegate);
-  core_->addRegistration(registration.get());
+  daemon_->addRegistration(registration.get());
   return registration;
 }
 
@@ -490,26 +145,28 @@ ErrorRef FakeKCInstallCoordination::KCCreateUserPresentableError(std::int64_t co
   return error;
 }
 
-void FakeKCInstallCoordination::setCoordinationEnabled(bool enabled) { core_->setEnabled(enabled); }
+void FakeKCInstallCoordination::setCoordinationEnabled(bool enabled) {
+  daemon_->setEnabled(enabled);
+}
 
 std::shared_ptr<FakeKCAppInstallCoordinator> FakeKCInstallCoordination::putCoordinator(
     KCCoordinatorKind kind, const std::string& bundleID, std::uint64_t creatorClient) {
-  return core_->put(kind, bundleID, creatorClient);
+  return daemon_->put(kind, bundleID, creatorClient);
 }
 
 std::shared_ptr<FakeKCAppInstallCoordinator> FakeKCInstallCoordination::coordinator(
     const std::string& bundleID) const {
-  return core_->find(bundleID);
+  return daemon_->find(bundleID);
 }
 
 std::vector<std::shared_ptr<FakeKCAppInstallCoordinator>> FakeKCInstallCoordination::coordinators()
     const {
-  return core_->all();
+  return daemon_->all();
 }
 
 bool FakeKCInstallCoordination::completeStoreDownload(const std::string& bundleID,
                                                       const std::string& packagePath) {
-  std::shared_ptr<FakeKCAppInstallCoordinator> c = core_->find(bundleID);
+  std::shared_ptr<FakeKCAppInstallCoordinator> c = daemon_->find(bundleID);
   if (!c) return false;
   FakeKCAppInstallCoordinator::Snapshot s = c->snapshot();
   if (s.state != FakeKCAppInstallCoordinator::State::Active) return false;
@@ -518,9 +175,9 @@ bool FakeKCInstallCoordination::completeStoreDownload(const std::string& bundleI
   }
   std::shared_ptr<KCPromisedTransferToPath> promise = s.appAssetPromise;
   if (!promise) {
-    promise = std::make_shared<FakeKCPromisedTransferToPath>(core_->hooks(), bundleID + "-Asset",
+    promise = std::make_shared<FakeKCPromisedTransferToPath>(daemon_->hooks(), bundleID + "-Asset",
                                                              KCClientBazaar, std::nullopt, 0,
-                                                             core_->nextPromiseIdentifier());
+                                                             daemon_->nextPromiseIdentifier());
     if (!c->adoptAppAssetPromise(promise)) return false;
   }
   promise->setTransferPath(packagePath);
@@ -531,11 +188,11 @@ bool FakeKCInstallCoordination::completeStoreDownload(const std::string& bundleI
 }
 
 bool FakeKCInstallCoordination::requestPrioritize(const std::string& bundleID) {
-  std::shared_ptr<FakeKCAppInstallCoordinator> c = core_->find(bundleID);
+  std::shared_ptr<FakeKCAppInstallCoordinator> c = daemon_->find(bundleID);
   if (!c) return false;
-  Core* core = core_.get();
-  core_->post([core, c] {
-    core->deliver(*c, [&](KCAppInstallObserverDelegate& d) { d.coordinatorShouldPrioritize(c); });
+  FakeKCDaemon* daemon = daemon_.get();
+  daemon_->post([daemon, c] {
+    daemon->deliver(*c, [&](KCAppInstallObserverDelegate& d) { d.coordinatorShouldPrioritize(c); });
   });
   return true;
 }
@@ -544,7 +201,7 @@ bool FakeKCInstallCoordination::notifyPromiseDidBeginFulfillment(std::uint64_t i
   auto holds = [identifier](const std::shared_ptr<KCPromise>& promise) {
     return promise && promiseIdentifier(*promise) == identifier;
   };
-  for (const auto& c : core_->all()) {
+  for (const auto& c : daemon_->all()) {
     FakeKCAppInstallCoordinator::Snapshot s = c->snapshot();
     bool found = holds(s.appAssetPromise) || holds(s.userDataPromise);
     for (const auto& promise : s.sprPromises) found = found || holds(promise);
@@ -552,9 +209,9 @@ bool FakeKCInstallCoordination::notifyPromiseDidBeginFulfillment(std::uint64_t i
       found = found || holds(placeholder->iconPromise());
     }
     if (!found) continue;
-    Core* core = core_.get();
-    core_->post([core, c, identifier] {
-      core->deliver(*c, [&](KCAppInstallObserverDelegate& d) {
+    FakeKCDaemon* daemon = daemon_.get();
+    daemon_->post([daemon, c, identifier] {
+      daemon->deliver(*c, [&](KCAppInstallObserverDelegate& d) {
         d.promiseDidBeginFulfillmentWithIdentifier(identifier);
       });
     });
@@ -572,11 +229,11 @@ std::optional<std::uint64_t> FakeKCInstallCoordination::promiseIdentifier(
 }
 
 void FakeKCInstallCoordination::removeObserver(const KCAppInstallObserverDelegate* observer) {
-  core_->removeObserverEverywhere(observer);
+  daemon_->removeObserverEverywhere(observer);
 }
 
-void FakeKCInstallCoordination::drain() { core_->drain(); }
-void FakeKCInstallCoordination::hold() { core_->hold(); }
-void FakeKCInstallCoordination::release() { core_->release(); }
+void FakeKCInstallCoordination::drain() { daemon_->drain(); }
+void FakeKCInstallCoordination::hold() { daemon_->hold(); }
+void FakeKCInstallCoordination::release() { daemon_->release(); }
 
 }  // namespace appsync

@@ -69,6 +69,7 @@
 namespace appsync {
 
 class FakeARWorkspace;
+class FakeKCDaemon;
 
 class FakeKCInstallCoordination final : public KCInstallCoordination, public FakeService {
  public:
@@ -146,8 +147,8 @@ class FakeKCInstallCoordination final : public KCInstallCoordination, public Fak
   void release();
 
  private:
-  class Core;
-  std::shared_ptr<Core> core_;
+  friend class FakeKCDaemon;  // counts the calls it makes on the service's behalf
+  std::shared_ptr<FakeKCDaemon> daemon_;
 };
 
 }  // namespace appsync

@@ -1,0 +1,232 @@
+// The fake application registry's installs and uninstalls: placeholder and package installs
+// into containers under the device root, removal, the calls made, and the events they cause.
+#include "platform/fake/fake_ar.h"
+
+#include <system_error>
+#include <utility>
+
+#include "runtime/fs/files.h"
+#include "platform/bundle_keys.h"
+#include "platform/fake/fake_ar_bundle_files.h"
+
+namespace appsync {
+
+namespace fs = std::filesystem;
+using fake_ar::iconIn, fake_ar::readInfoPlist, fake_ar::stringValue, fake_ar::treeSize,
+    fake_ar::writeMetadata;
+
+namespace {
+
+// Error codes of the registry's domain.
+constexpr std::int64_t kErrorBadPackage = 2;
+constexpr std::int64_t kErrorIdentifierMismatch = 3;
+constexpr std::int64_t kErrorFileOperation = 4;
+
+ErrorRef registryError(std::int64_t code, const std::string& description, const std::string& path) {
+  return makeError(kAppRegistryErrorDomain, code, description, path);
+}
+
+}  // namespace
+
+bool FakeARWorkspace::uninstallApplication(const std::string& identifier,
+                                           const std::optional<plist::Dict>& options) {
+  const bool failed = beginCall(kUninstall) != nullptr;
+  bool placeholdersOnly = false;
+  if (options) {
+    if (const plist::Value* v = options->find(kUninstallPlaceholdersOnlyKey)) {
+      placeholdersOnly = v->truthValue().value_or(false);
+    }
+  }
+  std::vector<std::uint64_t> registrations;
+  ARProxyList removed;
+  std::optional<std::string> container;
+  std::function<void(const std::string&)> hook;
+  bool succeeded = false;
+  {
+    std::lock_guard lock(mutex_);
+    const Entry* e = findLocked(identifier);
+    if (!failed && e && e->record.isApplication && (!placeholdersOnly || e->record.isPlaceholder)) {
+      succeeded = true;
+      removed.push_back(makeApplicationProxy(*e));
+      container = e->record.containerDirectory;
+      eraseLocked(identifier);
+      registrations = registrationsLocked();
+      hook = uninstallHook_;
+    }
+    uninstallCalls_.push_back({identifier, options, succeeded});
+  }
+  if (!succeeded) return false;
+  // Only containers this registry made are removed; a placeholder's own directory is not ours.
+  const std::optional<std::string> ours = containerDirectoryFor(identifier);
+  if (container && ours && *container == *ours) removeAll(*container);
+  if (hook) hook(identifier);
+  postEvent(std::move(registrations),
+            &ARApplicationWorkspaceObserverProtocol::applicationsDidUninstall, std::move(removed));
+  return true;
+}
+
+void FakeARWorkspace::recordInstall(const std::string& path, const plist::Dict& options,
+                                    bool placeholder, bool succeeded) {
+  std::lock_guard lock(mutex_);
+  installCalls_.push_back({path, options, placeholder, succeeded});
+}
+
+bool FakeARWorkspace::installApplication(const std::string& path, const plist::Dict& options) {
+  const bool ok = !beginCall(kInstallPlaceholder) && installPlaceholder(path, options);
+  recordInstall(path, options, true, ok);
+  return ok;
+}
+
+bool FakeARWorkspace::installApplication(const std::string& path, const plist::Dict& options,
+                                         ErrorRef* error) {
+  ErrorRef scripted = beginCall(kInstallPackage);
+  bool ok = false;
+  if (scripted) {
+    setError(error, scripted);
+  } else {
+    ok = installPackage(path, options, error);
+  }
+  recordInstall(path, options, false, ok);
+  return ok;
+}
+
+bool FakeARWorkspace::installPlaceholder(const std::string& path, const plist::Dict& options) {
+  const std::string* packageType = plist::stringAt(options, ARPackageTypeKey);
+  if (!packageType || *packageType != ARPackageTypePlaceholder) return false;
+  std::string why;
+  std::optional<plist::Dict> info = readInfoPlist(path, &why);
+  if (!info) return false;
+  std::optional<std::string> identifier = stringValue(*info, kBNBundleIdentifierKey);
+  if (!identifier || identifier->empty()) return false;
+  if (const plist::Value* requested = options.find(kBNBundleIdentifierKey)) {
+    if (!requested->string() || *requested->string() != *identifier) return false;
+  }
+  std::optional<std::string> container = containerDirectoryFor(*identifier);
+  if (!container) return false;
+
+  Entry entry;
+  {
+    std::lock_guard lock(mutex_);
+    if (const Entry* existing = findLocked(*identifier)) {
+      if (!existing->record.isApplication) return false;
+      entry = *existing;
+    }
+  }
+  AppRecord& r = entry.record;
+  r.identifier = *identifier;
+  r.version = stringValue(*info, kBNBundleVersionKey);
+  r.name = stringValue(*info, _kBNBundleDisplayNameKey);
+  r.installType = 0;
+  if (const plist::Value* type = options.find(ARInstallTypeKey)) {
+    r.installType = type->uint64().value_or(0);
+  }
+  r.isPlaceholder = true;
+  r.bundleDirectory = path;
+  r.iconPath = iconIn(path, *info);
+  r.lastInstallOptions = options;
+  if (writeMetadata(*container, options)) r.containerDirectory = container;
+
+  std::vector<std::uint64_t> registrations;
+  ARProxyList installed;
+  {
+    std::lock_guard lock(mutex_);
+    installed.push_back(makeApplicationProxy(entry));
+    putLocked(std::move(entry));
+    registrations = registrationsLocked();
+  }
+  postEvent(std::move(registrations),
+            &ARApplicationWorkspaceObserverProtocol::applicationsDidInstall, std::move(installed));
+  return true;
+}
+
+bool FakeARWorkspace::installPackage(const std::string& path, const plist::Dict& options,
+                                     ErrorRef* error) {
+  std::string bundlePath = path;
+  while (bundlePath.size() > 1 && bundlePath.back() == '/') bundlePath.pop_back();
+  const std::string bundleName = fs::path(bundlePath).filename().string();
+  if (!directoryExists(bundlePath) || bundleName.empty()) {
+    setError(error, registryError(kErrorBadPackage, "Package is not a bundle directory", path));
+    return false;
+  }
+  std::string why;
+  std::optional<plist::Dict> info = readInfoPlist(bundlePath, &why);
+  if (!info) {
+    setError(error,
+             registryError(kErrorBadPackage, "Package has no usable Info.plist: " + why, path));
+    return false;
+  }
+  std::optional<std::string> identifier = stringValue(*info, kBNBundleIdentifierKey);
+  const std::string* requested = plist::stringAt(options, kBNBundleIdentifierKey);
+  if (!identifier || identifier->empty() || !requested || *requested != *identifier) {
+    setError(error, registryError(kErrorIdentifierMismatch,
+                                  "Package identifier " + identifier.value_or("(null)") +
+                                      " does not match the requested " +
+                                      (requested ? *requested : std::string("(null)")),
+                                  path));
+    return false;
+  }
+  std::optional<std::string> container = containerDirectoryFor(*identifier);
+  if (!container) {
+    setError(error,
+             registryError(kErrorBadPackage, "Invalid bundle identifier " + *identifier, path));
+    return false;
+  }
+
+  // Replace whatever bundle the container held; keep its other files.
+  ErrorRef fileError;
+  if (!createDirectories(*container, &fileError)) {
+    setError(error, registryError(kErrorFileOperation, "Cannot create the container", *container));
+    return false;
+  }
+  std::error_code ec;
+  for (fs::directory_iterator it(*container, ec), end; !ec && it != end; it.increment(ec)) {
+    if (it->path().extension() == ".app") removeAll(it->path().string());
+  }
+  const std::string installed = (fs::path(*container) / bundleName).string();
+  removeAll(installed);
+  fs::copy(bundlePath, installed, fs::copy_options::recursive | fs::copy_options::copy_symlinks,
+           ec);
+  if (ec) {
+    removeAll(installed);
+    setError(error, registryError(kErrorFileOperation, "Cannot copy the bundle: " + ec.message(),
+                                  installed));
+    return false;
+  }
+  writeMetadata(*container, options);
+
+  Entry entry;
+  {
+    std::lock_guard lock(mutex_);
+    if (const Entry* existing = findLocked(*identifier)) entry.record = existing->record;
+  }
+  AppRecord& r = entry.record;
+  r.identifier = *identifier;
+  r.isApplication = true;
+  r.version = stringValue(*info, kBNBundleVersionKey);
+  if (auto name = stringValue(*info, _kBNBundleDisplayNameKey)) r.name = std::move(name);
+  if (const plist::Value* type = options.find(ARInstallTypeKey)) {
+    r.installType = type->uint64().value_or(r.installType);
+  }
+  r.isPlaceholder = false;
+  r.bundleDirectory = installed;
+  r.containerDirectory = container;
+  r.iconPath = iconIn(installed, *info);
+  r.staticDiskUsage = treeSize(installed);
+  r.lastInstallOptions = options;
+  // entry.currentProgress stays null: the install is complete.
+
+  std::vector<std::uint64_t> registrations;
+  ARProxyList proxies;
+  {
+    std::lock_guard lock(mutex_);
+    std::erase_if(progress_, [&](const auto& item) { return item.first.first == *identifier; });
+    proxies.push_back(makeApplicationProxy(entry));
+    putLocked(std::move(entry));
+    registrations = registrationsLocked();
+  }
+  postEvent(std::move(registrations),
+            &ARApplicationWorkspaceObserverProtocol::applicationsDidInstall, std::move(proxies));
+  return true;
+}
+
+}  // namespace appsync
