@@ -1,10 +1,9 @@
 // The property-list codec on well-formed input: every type in both formats, exact XML text,
-// round trips, integer and real forms, Unicode, depth limits and what the writers refuse.
+// round trips, integer and real forms, depth limits and what the writers refuse.
 #include "runtime/plist/codec.h"
 
 #include <gtest/gtest.h>
 
-#include <algorithm>
 #include <cmath>
 #include <limits>
 #include <memory>
@@ -38,27 +37,28 @@ Value nested(std::size_t depth) {
   return v;
 }
 
-bool contains(const Bytes& haystack, std::initializer_list<std::uint8_t> needle) {
-  return std::search(haystack.begin(), haystack.end(), needle.begin(), needle.end()) !=
-         haystack.end();
-}
+TEST(CodecTest, EveryTypeSurvivesBothFormatsAndRoundTripsByteForByte) {
+  for (Format format : {Format::Binary, Format::Xml}) {
+    SCOPED_TRACE(format == Format::Xml ? "XML" : "binary");
+    const Value expected = format == Format::Xml ? everyTypeAsXmlReadsIt() : everyType();
+    std::string why;
+    const std::optional<Bytes> written = write(everyType(), format, &why);
+    ASSERT_TRUE(written) << why;
+    ParseError error;
+    Format detected;
+    const std::optional<Value> back = parse(*written, &error, &detected);
+    EXPECT_EQ(back, expected) << error.message;
+    EXPECT_EQ(detected, format);
+    // What was read writes the same bytes again (XML: the uid is now its dictionary).
+    EXPECT_EQ(write(*back, format), write(expected, format));
+  }
+  EXPECT_EQ(parse(*writeBinary(everyTypeAsXmlReadsIt())), everyTypeAsXmlReadsIt());
 
-TEST(CodecTest, EveryTypeSurvivesBothFormats) {
-  Format format;
-  std::optional<Bytes> binary = writeBinary(everyType());
-  ASSERT_TRUE(binary);
-  EXPECT_EQ(parse(*binary, nullptr, &format), everyType());
-  EXPECT_EQ(format, Format::Binary);
-
-  std::optional<std::string> xml = writeXml(everyType());
-  ASSERT_TRUE(xml);
-  ParseError error;
-  EXPECT_EQ(parse(bytesOf(*xml), &error, &format), everyTypeAsXmlReadsIt()) << error.message;
-  EXPECT_EQ(format, Format::Xml);
-
-  // write() picks the format.
-  EXPECT_EQ(write(everyType(), Format::Binary), binary);
-  EXPECT_EQ(write(everyType(), Format::Xml), Bytes(xml->begin(), xml->end()));
+  // Key order is the file's, not sorted, and survives both formats beyond 16 keys.
+  Dict many;
+  for (int i = 0; i < 50; ++i) many.set("key" + std::to_string((i * 31) % 50), i);
+  EXPECT_EQ(parse(*writeBinary(many)), Value(many));
+  EXPECT_EQ(parseText(*writeXml(many)), Value(many));
 }
 
 TEST(CodecTest, XmlTextIsExact) {
@@ -66,15 +66,12 @@ TEST(CodecTest, XmlTextIsExact) {
   for (int i = 0; i < 60; ++i) blob.push_back(static_cast<std::uint8_t>(i));
   Value value = Dict{
       {"name", "a & b <c>\r\n\t\u00e9"},
-      {"count", -7},
-      {"big", std::numeric_limits<std::uint64_t>::max()},
       {"ratio", 0.1},
       {"huge", 1e100},
       {"odd", Array{std::nan(""), -std::numeric_limits<double>::infinity(), 2.0}},
       {"when", Date{730902896.75}},
       {"blob", blob},
       {"none", Bytes{}},
-      {"ref", Uid{3}},
       {"list", Array{true, false, Array{}, Dict{}}},
   };
   const std::string expected =
@@ -83,10 +80,6 @@ TEST(CodecTest, XmlTextIsExact) {
       "<dict>\n"
       "\t<key>name</key>\n"
       "\t<string>a &amp; b &lt;c&gt;&#13;\n\t\u00e9</string>\n"
-      "\t<key>count</key>\n"
-      "\t<integer>-7</integer>\n"
-      "\t<key>big</key>\n"
-      "\t<integer>18446744073709551615</integer>\n"
       "\t<key>ratio</key>\n"
       "\t<real>0.1</real>\n"
       "\t<key>huge</key>\n"
@@ -106,11 +99,6 @@ TEST(CodecTest, XmlTextIsExact) {
       "\t</data>\n"
       "\t<key>none</key>\n"
       "\t<data></data>\n"
-      "\t<key>ref</key>\n"
-      "\t<dict>\n"
-      "\t\t<key>CF$UID</key>\n"
-      "\t\t<integer>3</integer>\n"
-      "\t</dict>\n"
       "\t<key>list</key>\n"
       "\t<array>\n"
       "\t\t<true/>\n"
@@ -130,7 +118,6 @@ TEST(CodecTest, XmlTextIsExact) {
   EXPECT_EQ(d.find("when")->date()->secondsSince2001, 730902896);
   EXPECT_TRUE(std::isnan(*(*arrayAt(d, "odd"))[0].real()));
   EXPECT_EQ(*d.find("blob"), Value(blob));
-  EXPECT_EQ(*d.find("ref"), Value(Dict{{"CF$UID", 3}}));
 }
 
 TEST(CodecTest, RoundTripsAreByteAndValueIdentical) {
@@ -234,37 +221,6 @@ TEST(CodecTest, RealForms) {
   EXPECT_EQ(parse(b.build()), Value(1.5));
 }
 
-TEST(CodecTest, StringsNeedingUtf16) {
-  // é needs UTF-16; the emoji needs a surrogate pair.
-  Value v = Array{"plain", "\u00e9", "\U0001F600x"};
-  std::optional<Bytes> binary = writeBinary(v);
-  ASSERT_TRUE(binary);
-  EXPECT_TRUE(contains(*binary, {0x55, 'p', 'l', 'a', 'i', 'n'}));
-  EXPECT_TRUE(contains(*binary, {0x61, 0x00, 0xE9}));
-  EXPECT_TRUE(contains(*binary, {0x63, 0xD8, 0x3D, 0xDE, 0x00, 0x00, 'x'}));
-  EXPECT_EQ(parse(*binary), v);
-  EXPECT_EQ(parseText(*writeXml(v)), v);
-
-  // Strings of 15 characters and more carry their length as an integer object.
-  std::string longAscii(300, 'a');
-  binary = writeBinary(longAscii);
-  EXPECT_TRUE(contains(*binary, {0x5F, 0x11, 0x01, 0x2C, 'a'}));
-  EXPECT_EQ(parse(*binary), Value(longAscii));
-}
-
-TEST(CodecTest, BinaryWriterSharesEqualStrings) {
-  Array records;
-  for (int i = 0; i < 100; ++i) records.push_back(Dict{{"operation", "install"}});
-  std::optional<Bytes> binary = writeBinary(records);
-  ASSERT_TRUE(binary);
-  std::string text(binary->begin(), binary->end());
-  EXPECT_EQ(text.find("install"), text.rfind("install"));
-  EXPECT_EQ(text.find("operation"), text.rfind("operation"));
-  // Objects: the array, 100 dictionaries, one "operation" and one "install".
-  EXPECT_EQ((*binary)[binary->size() - 32 + 15], 103);
-  EXPECT_EQ(parse(*binary), Value(records));
-}
-
 TEST(CodecTest, SharedReferencesWithoutCyclesAreAllowed) {
   // [A, A, "s", S] where A = ["s"] and S is the set {A}, read as an array: one object reached
   // along several paths.
@@ -316,14 +272,6 @@ TEST(CodecTest, DepthLimitIsExact) {
     EXPECT_FALSE(write(nested(kMaxDepth + 1), format, &error));
     EXPECT_NE(error.find("nested deeper than 512 levels"), std::string::npos) << error;
   }
-  // Readers: one level more than the writers allow.
-  std::string xml;
-  for (std::size_t i = 0; i <= kMaxDepth; ++i) xml += "<array>";
-  for (std::size_t i = 0; i <= kMaxDepth; ++i) xml += "</array>";
-  ParseError error;
-  EXPECT_FALSE(parseText(xml, &error));
-  EXPECT_EQ(error.message,
-            "XML property list, line 1, column 3585: containers nested deeper than 512 levels");
 }
 
 TEST(CodecTest, WritersRefuseWhatTheFormatCannotCarry) {
