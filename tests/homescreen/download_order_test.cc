@@ -6,9 +6,9 @@
 #include <vector>
 
 #include "client/apps_client.h"
+#include "platform/fake/fake_platform.h"
 #include "runtime/fs/files.h"
 #include "runtime/plist/codec.h"
-#include "platform/fake/fake_platform.h"
 #include "support/temp_dir.h"
 
 namespace appsync {
@@ -38,81 +38,47 @@ Ids keysOf(const plist::Dict& items) {
   return keys;
 }
 
-Ids prefixed(const Ids& messages) {
-  Ids out;
-  for (const std::string& m : messages) out.push_back("com.vantor.trc.AppSync|" + m);
-  return out;
+// The parts of `text` between `separator`s.
+Ids split(std::string_view text, char separator) {
+  Ids parts;
+  while (!text.empty()) {
+    const std::size_t end = std::min(text.find(separator), text.size());
+    parts.emplace_back(text.substr(0, end));
+    text.remove_prefix(std::min(end + 1, text.size()));
+  }
+  return parts;
 }
 
 TEST(DownloadOrderTest, PlacesItemsByIconOrderThenTheRestByIdentifier) {
+  const std::string saved = "saved icon sort order|", none = "got no icon sort order from PV|";
   struct Case {
     const char* name;
     std::optional<plist::Bytes> iconState;  // absent: the home screen hands out no buffer
-    Ids items;                              // insertion order of the caller's dictionary
-    Ids expectedOrder;
-    Ids expectedLeft;
-    Ids expectedMessages;
-    bool homeScreenFails = false;
-    bool workAreaExists = true;
+    const char* items;                      // insertion order of the caller's dictionary
+    const char* order;
+    const char* left;
+    std::string messages;  // separated by '|'
+    bool homeScreenFails = false, workAreaExists = true;
   };
   const Case cases[] = {
-      {.name = "listed twice, unknown ids and non-strings are passed over",
-       .iconState = binaryArray({"com.c", 5, "com.x", "com.a", "com.c"}),
-       .items = {"com.d", "com.c", "com.b", "com.a"},
-       .expectedOrder = {"com.c", "com.a", "com.b", "com.d"},
-       .expectedLeft = {"com.d", "com.b"},
-       .expectedMessages = {"saved icon sort order", "prioritize com.c", "prioritize com.a",
-                            "lastly com.b", "lastly com.d"}},
-      {.name = "every item listed",
-       .iconState = binaryArray({"com.b", "com.a"}),
-       .items = {"com.a", "com.b"},
-       .expectedOrder = {"com.b", "com.a"},
-       .expectedLeft = {},
-       .expectedMessages = {"saved icon sort order", "prioritize com.b", "prioritize com.a"}},
-      {.name = "no icon order",
-       .iconState = std::nullopt,
-       .items = {"com.b", "com.a"},
-       .expectedOrder = {"com.a", "com.b"},
-       .expectedLeft = {"com.b", "com.a"},
-       .expectedMessages = {"got no icon sort order from PV", "lastly com.a", "lastly com.b"}},
-      {.name = "home screen fails",
-       .iconState = binaryArray({"com.a"}),
-       .items = {"com.b", "com.a"},
-       .expectedOrder = {"com.a", "com.b"},
-       .expectedLeft = {"com.b", "com.a"},
-       .expectedMessages = {"got no icon sort order from PV", "lastly com.a", "lastly com.b"},
-       .homeScreenFails = true},
-      {.name = "order that does not parse",
-       .iconState = text("<plist><array><string>com.a</array>"),
-       .items = {"com.b", "com.a"},
-       .expectedOrder = {"com.a", "com.b"},
-       .expectedLeft = {"com.b", "com.a"},
-       .expectedMessages = {"saved icon sort order", "lastly com.a", "lastly com.b"}},
-      {.name = "order that is not an array",
-       .iconState = plist::writeBinary(plist::Value(plist::Dict{{"com.a", 1}})).value(),
-       .items = {"com.a"},
-       .expectedOrder = {"com.a"},
-       .expectedLeft = {"com.a"},
-       .expectedMessages = {"saved icon sort order", "lastly com.a"}},
-      {.name = "empty order",
-       .iconState = plist::Bytes{},
-       .items = {"com.a"},
-       .expectedOrder = {"com.a"},
-       .expectedLeft = {"com.a"},
-       .expectedMessages = {"saved icon sort order", "lastly com.a"}},
-      {.name = "no items",
-       .iconState = binaryArray({"com.a"}),
-       .items = {},
-       .expectedOrder = {},
-       .expectedLeft = {},
-       .expectedMessages = {"saved icon sort order"}},
-      {.name = "sort-order file cannot be written",
-       .iconState = binaryArray({"com.b"}),
-       .items = {"com.a", "com.b"},
-       .expectedOrder = {"com.b", "com.a"},
-       .expectedLeft = {"com.a"},
-       .expectedMessages = {"saved icon sort order", "prioritize com.b", "lastly com.a"},
-       .workAreaExists = false},
+      {"listed twice, unknown ids and non-strings are passed over",
+       binaryArray({"com.c", 5, "com.x", "com.a", "com.c"}), "com.d com.c com.b com.a",
+       "com.c com.a com.b com.d", "com.d com.b",
+       saved + "prioritize com.c|prioritize com.a|lastly com.b|lastly com.d"},
+      {"every item listed", binaryArray({"com.b", "com.a"}), "com.a com.b", "com.b com.a", "",
+       saved + "prioritize com.b|prioritize com.a"},
+      {"no icon order", std::nullopt, "com.b com.a", "com.a com.b", "com.b com.a",
+       none + "lastly com.a|lastly com.b"},
+      {"home screen fails", binaryArray({"com.a"}), "com.b com.a", "com.a com.b", "com.b com.a",
+       none + "lastly com.a|lastly com.b", true},
+      {"order that does not parse", text("<plist><array><string>com.a</array>"), "com.b com.a",
+       "com.a com.b", "com.b com.a", saved + "lastly com.a|lastly com.b"},
+      {"order that is not an array", plist::writeBinary(plist::Dict{{"com.a", 1}}), "com.a",
+       "com.a", "com.a", saved + "lastly com.a"},
+      {"empty order", plist::Bytes{}, "com.a", "com.a", "com.a", saved + "lastly com.a"},
+      {"no items", binaryArray({"com.a"}), "", "", "", saved},
+      {"sort-order file cannot be written", binaryArray({"com.b"}), "com.a com.b", "com.b com.a",
+       "com.a", saved + "prioritize com.b|lastly com.a", false, false},
   };
   for (const Case& c : cases) {
     SCOPED_TRACE(c.name);
@@ -124,29 +90,31 @@ TEST(DownloadOrderTest, PlacesItemsByIconOrderThenTheRestByIdentifier) {
     device.pv().setFlattenedIconState(c.iconState);
     if (c.homeScreenFails) device.pv().failOperation("PVGetFlattenedIconState");
     plist::Dict items;
-    for (const std::string& id : c.items) {
+    for (const std::string& id : split(c.items, ' ')) {
       items.set(id, plist::Dict{{"identifier", id}, {"url", "https://host/" + id}});
     }
 
     const plist::Array ordered = AppsClient::_orderTheItems(device.platform(), items);
 
-    EXPECT_EQ(identifiersOf(ordered), c.expectedOrder);
-    EXPECT_EQ(keysOf(items), c.expectedLeft);
+    EXPECT_EQ(identifiersOf(ordered), split(c.order, ' '));
+    EXPECT_EQ(keysOf(items), split(c.left, ' '));
     // Records come back whole, not just their identifiers.
     for (const plist::Value& record : ordered) {
       const std::string* id = plist::stringAt(*record.dict(), "identifier");
       EXPECT_EQ(*plist::stringAt(*record.dict(), "url"), "https://host/" + *id);
     }
-    EXPECT_EQ(device.log().messages(), prefixed(c.expectedMessages));
+    Ids expected;
+    for (const std::string& m : split(c.messages, '|')) {
+      expected.push_back("com.vantor.trc.AppSync|" + m);
+    }
+    EXPECT_EQ(device.log().messages(), expected);
     for (const auto& line : device.log().lines()) EXPECT_EQ(line.level, LogLevel::Default);
     EXPECT_EQ(device.pv().outstandingBuffers(), 0u);
-    const bool saved = c.iconState && !c.homeScreenFails && c.workAreaExists;
+    const bool isSaved = c.iconState && !c.homeScreenFails && c.workAreaExists;
     EXPECT_EQ(readFile(device.paths().assetSortOrder()),
-              saved ? c.iconState : std::optional<plist::Bytes>());
+              isSaved ? c.iconState : std::optional<plist::Bytes>());
     // Ordering never creates the work area.
-    if (!c.workAreaExists) {
-      EXPECT_FALSE(directoryExists(device.paths().workArea()));
-    }
+    EXPECT_EQ(directoryExists(device.paths().workArea()), c.workAreaExists);
   }
 }
 

@@ -6,8 +6,8 @@
 #include <vector>
 
 #include "client/apps_client.h"
-#include "runtime/fs/files.h"
 #include "platform/fake/fake_platform.h"
+#include "runtime/fs/files.h"
 #include "support/temp_dir.h"
 
 namespace appsync {
@@ -26,36 +26,31 @@ Levels levelsOf(MemoryLogSink& log) {
   return levels;
 }
 
-TEST(SyncNotificationTest, StateIsSetBeforeEachPost) {
-  testing::TempDir root;
-  FakePlatform device(root.path());
-  AppsClient::_notifyPavilion(device.platform(), true);
-  AppsClient::_notifyPavilion(device.platform(), false);
+TEST(SyncNotificationTest, StateIsSetBeforeEachPostAndARegistrationFailureIsLogged) {
+  using States = std::vector<std::optional<std::uint64_t>>;
+  const std::string start = "com.vantor.trc.AppSync|Notifying PV we are starting syncing",
+                    done = "com.vantor.trc.AppSync|Notifying PV we are done syncing",
+                    failed = "com.vantor.trc.AppSync|Uh Oh...can't send notification to PV:1000000";
+  const auto [ok, error] = std::pair{LogLevel::Default, LogLevel::Error};
+  for (bool registrationFails : {false, true}) {
+    SCOPED_TRACE(registrationFails ? "registration fails" : "registered");
+    testing::TempDir root;
+    FakePlatform device(root.path());
+    if (registrationFails) {
+      device.system().failOperation("notifyRegisterCheck", makeError("NotifyError", 1000000));
+    }
+    AppsClient::_notifyPavilion(device.platform(), true);
+    AppsClient::_notifyPavilion(device.platform(), false);
 
-  EXPECT_EQ(device.system().notificationState(kSyncNotification), 0u);
-  EXPECT_EQ(device.system().postCount(kSyncNotification), 2u);
-  EXPECT_EQ(device.system().statesAtPosts(kSyncNotification),
-            (std::vector<std::optional<std::uint64_t>>{1u, 0u}));
-  EXPECT_EQ(device.log().messages(),
-            (std::vector<std::string>{"com.vantor.trc.AppSync|Notifying PV we are starting syncing",
-                                      "com.vantor.trc.AppSync|Notifying PV we are done syncing"}));
-  EXPECT_EQ(levelsOf(device.log()), (Levels{LogLevel::Default, LogLevel::Default}));
-}
-
-TEST(SyncNotificationTest, RegistrationFailureLogsTheStatusAndPostsNothing) {
-  testing::TempDir root;
-  FakePlatform device(root.path());
-  device.system().failOperation("notifyRegisterCheck", makeError("NotifyError", 1000000));
-  AppsClient::_notifyPavilion(device.platform(), true);
-
-  EXPECT_EQ(device.system().postCount(kSyncNotification), 0u);
-  EXPECT_EQ(device.system().callCount("notifySetState"), 0u);
-  EXPECT_FALSE(device.system().notificationState(kSyncNotification));
-  EXPECT_EQ(device.log().messages(),
-            (std::vector<std::string>{
-                "com.vantor.trc.AppSync|Notifying PV we are starting syncing",
-                "com.vantor.trc.AppSync|Uh Oh...can't send notification to PV:1000000"}));
-  EXPECT_EQ(levelsOf(device.log()), (Levels{LogLevel::Default, LogLevel::Error}));
+    EXPECT_EQ(device.system().statesAtPosts(kSyncNotification),
+              (registrationFails ? States{} : States{1u, 0u}));
+    EXPECT_EQ(device.system().callCount("notifySetState"), registrationFails ? 0u : 2u);
+    EXPECT_EQ(device.log().messages(),
+              (registrationFails ? std::vector<std::string>{start, failed, done, failed}
+                                 : std::vector<std::string>{start, done}));
+    EXPECT_EQ(levelsOf(device.log()),
+              (registrationFails ? Levels{ok, error, ok, error} : Levels{ok, ok}));
+  }
 }
 
 TEST(IconLayoutTest, HandsOverTheLayoutByteExactUnlessMissingOrEmpty) {

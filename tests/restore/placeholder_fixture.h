@@ -8,9 +8,9 @@
 #include <string_view>
 
 #include "client/apps_client.h"
+#include "platform/fake/fake_platform.h"
 #include "runtime/fs/files.h"
 #include "runtime/plist/codec.h"
-#include "platform/fake/fake_platform.h"
 #include "support/temp_dir.h"
 
 namespace appsync::testing {
@@ -43,6 +43,17 @@ inline std::vector<std::string> linesStartingWith(const MemoryLogSink& log,
     }
   }
   return out;
+}
+
+// Expects exactly one message of category 8 starting with `prefix`, at `level`.
+inline void expectOneLine(const MemoryLogSink& log, std::string_view prefix, LogLevel level) {
+  const std::vector<std::string> lines = linesStartingWith(log, prefix);
+  EXPECT_EQ(lines.size(), 1u) << prefix;
+  for (const auto& line : log.lines()) {
+    if (line.category == 8 && line.message.starts_with(prefix)) {
+      EXPECT_EQ(line.level, level) << line.message;
+    }
+  }
 }
 
 struct PlaceholderDevice {

@@ -8,6 +8,7 @@
 namespace appsync {
 namespace {
 
+using testing::expectOneLine;
 using testing::PlaceholderDevice;
 using testing::pluginLine;
 
@@ -15,132 +16,82 @@ const std::string kID = "com.example.app";
 const plist::Bytes kIcon = {0x89, 'P', 'N', 'G', 1, 2, 3};
 const plist::Bytes kSinf = {5, 4, 3};
 
-// The one line whose message starts with `prefix` (category 8), with its level checked.
-void expectOneLine(const MemoryLogSink& log, const std::string& prefix, LogLevel level) {
-  std::size_t seen = 0;
-  for (const auto& line : log.lines()) {
-    if (line.category != 8 || !std::string_view(line.message).starts_with(prefix)) continue;
-    ++seen;
-    EXPECT_EQ(line.level, level) << line.message;
-  }
-  EXPECT_EQ(seen, 1u) << prefix;
-}
-
-struct SuccessCase {
-  const char* name;
-  plist::Dict metadata;
-  std::string expectedName;
-  bool withIcon = true;
-  bool withSinf = true;
-  plist::Value expectedGazette = false;
-  bool expectedLaunchProhibited = false;
-};
-
 TEST(RestorePlaceholderTest, BuildsAndInstallsThePlaceholder) {
-  const SuccessCase cases[] = {
-      {.name = "title wins over itemName",
-       .metadata = {{"title", "Sample"}, {"itemName", "Other"}, {"bundleVersion", "1.2"}},
-       .expectedName = "Sample"},
-      {.name = "itemName without title",
-       .metadata = {{"itemName", "Item"}, {"bundleVersion", "3"}},
-       .expectedName = "Item"},
-      {.name = "first launch key present wins",
-       .metadata = {{"title", "T"},
-                    {"bundleVersion", "1"},
-                    {"ARApplicationLaunchProhibited", false},
-                    {"launchProhibited", true}},
-       .expectedName = "T"},
-      {.name = "second launch key when the first is absent",
-       .metadata = {{"title", "T"}, {"bundleVersion", "1"}, {"launchProhibited", "YES"}},
-       .expectedName = "T",
-       .expectedLaunchProhibited = true},
-      {.name = "gazette as stored",
-       .metadata = {{"title", "T"}, {"bundleVersion", "1"}, {"UIGazetteApp", true}},
-       .expectedName = "T",
-       .expectedGazette = true},
-      {.name = "no icon",
-       .metadata = {{"title", "T"}, {"bundleVersion", "1"}},
-       .expectedName = "T",
-       .withIcon = false},
-      {.name = "no SINF",
-       .metadata = {{"title", "T"}, {"bundleVersion", "1"}},
-       .expectedName = "T",
-       .withSinf = false},
+  struct Case {
+    const char* name;
+    plist::Dict metadata;  // bundleVersion "1" is added
+    std::string expectedName;
+    bool gazette = false, launchProhibited = false, withIcon = true, withSinf = true;
   };
-  for (const SuccessCase& c : cases) {
+  const Case cases[] = {
+      {"title wins over itemName", {{"title", "Sample"}, {"itemName", "Other"}}, "Sample"},
+      {"itemName without title", {{"itemName", "Item"}}, "Item"},
+      {"first launch key present wins",
+       {{"title", "T"}, {"ARApplicationLaunchProhibited", false}, {"launchProhibited", true}},
+       "T"},
+      {"second launch key", {{"title", "T"}, {"launchProhibited", "YES"}}, "T", false, true},
+      {"gazette as stored", {{"title", "T"}, {"UIGazetteApp", true}}, "T", true},
+      {"no icon", {{"title", "T"}}, "T", false, false, false},
+      {"no SINF", {{"title", "T"}}, "T", false, false, true, false},
+  };
+  for (const Case& c : cases) {
     SCOPED_TRACE(c.name);
     PlaceholderDevice d;
-    const plist::Bytes metadataBytes = testing::binaryPlist(c.metadata);
-    const std::string dir = d.placeholderDir(kID);
-    const std::string icon = dir + "/Icon.png";
-    const std::string version = *plist::stringAt(c.metadata, "bundleVersion");
+    plist::Dict metadata = c.metadata;
+    metadata.set("bundleVersion", "1");
+    const plist::Bytes metadataBytes = testing::binaryPlist(metadata);
+    const std::string dir = d.placeholderDir(kID), icon = dir + "/Icon.png";
 
     EXPECT_TRUE(d.client._processCaravelRestoreInfoForApp(
         kID, metadataBytes, c.withSinf ? std::optional(kSinf) : std::nullopt,
         c.withIcon ? std::optional(kIcon) : std::nullopt));
 
-    // Info.plist, key by key.
-    auto info = testing::readDict(dir + "/Info.plist");
-    ASSERT_TRUE(info);
-    EXPECT_EQ(info->size(), 7u);
-    EXPECT_EQ(*info->find("BNBundleIdentifier"), plist::Value(kID));
-    EXPECT_EQ(*info->find("BNBundleVersion"), plist::Value(version));
-    EXPECT_EQ(*info->find("BNBundleExecutable"), plist::Value(c.expectedName));
-    EXPECT_EQ(*info->find("BNBundleDisplayName"), plist::Value(c.expectedName));
-    EXPECT_EQ(*info->find("BNBundleIconFile"), plist::Value("Icon.png"));
-    EXPECT_EQ(*info->find("UIGazetteApp"), c.expectedGazette);
-    EXPECT_EQ(*info->find("ARApplicationLaunchProhibited"),
-              plist::Value(c.expectedLaunchProhibited));
-
+    const plist::Dict info{{"BNBundleIdentifier", kID},
+                           {"BNBundleVersion", "1"},
+                           {"BNBundleExecutable", c.expectedName},
+                           {"BNBundleDisplayName", c.expectedName},
+                           {"BNBundleIconFile", "Icon.png"},
+                           {"UIGazetteApp", c.gazette},
+                           {"ARApplicationLaunchProhibited", c.launchProhibited}};
+    EXPECT_EQ(testing::readDict(dir + "/Info.plist"), info);
     EXPECT_EQ(readFile(icon), c.withIcon ? std::optional(kIcon) : std::nullopt);
-
-    // The five options, as the registry received them.
     auto calls = d.device.ar().installCalls();
     ASSERT_EQ(calls.size(), 1u);
     EXPECT_EQ(calls[0].path, dir);
-    EXPECT_TRUE(calls[0].placeholder);
-    const plist::Dict& options = calls[0].options;
-    EXPECT_EQ(options.size(), 5u);
-    EXPECT_EQ(*options.find(ARPackageTypeKey), plist::Value(ARPackageTypePlaceholder));
-    EXPECT_EQ(*options.find("BNBundleIdentifier"), plist::Value(kID));
-    EXPECT_EQ(options.find("ARInstallType")->uint64(), 2u);
-    EXPECT_EQ(*options.find(ARCaravelMetadataKey), plist::Value(metadataBytes));
-    if (c.withSinf) {
-      EXPECT_EQ(*options.find(ARApplicationSINFKey), plist::Value(kSinf));
-    } else {
-      EXPECT_EQ(options.find(ARApplicationSINFKey)->type(), plist::Type::Null);
-    }
-
-    // The registry really lists it.
+    EXPECT_EQ(calls[0].options,
+              (plist::Dict{{"PackageType", "Placeholder"},
+                           {"BNBundleIdentifier", kID},
+                           {"ARInstallType", 2u},
+                           {std::string(ARCaravelMetadataKey), metadataBytes},
+                           {std::string(ARApplicationSINFKey),
+                            c.withSinf ? plist::Value(kSinf) : plist::Value::null()}}));
+    // The registry lists it, and keeps the metadata in the application's container.
     auto record = d.device.ar().application(kID);
     ASSERT_TRUE(record);
     EXPECT_TRUE(record->isPlaceholder);
     EXPECT_EQ(record->installType, 2u);
     EXPECT_EQ(record->name, c.expectedName);
-    EXPECT_EQ(record->version, version);
     EXPECT_EQ(record->iconPath, c.withIcon ? std::optional(icon) : std::nullopt);
-
+    EXPECT_EQ(readFile(d.root / ("private/var/containers/Bundle/Application/" + kID +
+                                 "/CaravelMetadata.plist")),
+              metadataBytes);
     EXPECT_EQ(d.scenarios(), std::vector<std::string>{
                                  "Caravel App Restore yes com.example.app: Installed placeholder"});
-
     // Owner and group: the directory, the parent it made, the icon.
     for (const std::string& path : {dir, d.appsDir()}) {
       auto owner = d.device.system().ownership(path);
       ASSERT_TRUE(owner) << path;
-      EXPECT_EQ(owner->owner, "mobile");
-      EXPECT_EQ(owner->group, "mobile");
+      EXPECT_EQ(owner->owner + ":" + owner->group, "mobile:mobile");
     }
     EXPECT_EQ(d.device.system().ownership(icon).has_value(), c.withIcon);
 
     const MemoryLogSink& log = d.device.log();
-    const std::string gazette =
-        c.expectedGazette.boolean() && *c.expectedGazette.boolean() ? "1" : "0";
     EXPECT_TRUE(log.contains(pluginLine("processing app restore info for 'com.example.app'")));
     EXPECT_TRUE(log.contains(pluginLine("creating placeholder for 'com.example.app'. info.plist=" +
-                                        plist::Value(*info).describe())));
+                                        plist::Value(info).describe())));
     expectOneLine(log,
                   pluginLine("Installed Placeholder app from path " + dir + ": " + c.expectedName +
-                             " [com.example.app " + version + "] [isGazette: " + gazette + "]"),
+                             " [com.example.app 1] [isGazette: " + (c.gazette ? "1" : "0") + "]"),
                   LogLevel::Default);
     if (c.withIcon) {
       expectOneLine(log,
@@ -154,105 +105,77 @@ TEST(RestorePlaceholderTest, BuildsAndInstallsThePlaceholder) {
   }
 }
 
-struct FailureCase {
-  const char* name;
-  std::optional<plist::Value> metadata;  // absent: bytes that are no property list
-  std::vector<std::string> scenarios;
-  std::vector<std::pair<std::string, LogLevel>> messages;  // prefixes; "DIR": the directory
-  std::string id = kID;
-  std::function<void(PlaceholderDevice&)> setup = nullptr;
-  bool finalMessage = true;
-  bool directoryLeft = false, iconLeft = false, infoLeft = false;
-  std::size_t installCalls = 0;
-};
-
 TEST(RestorePlaceholderTest, FailuresStopWhereTheyHappen) {
-  const plist::Dict complete{{"title", "T"}, {"bundleVersion", "1"}};
-  const auto entry = [](const std::string& id, const char* what) {
-    return "Caravel App Restore no " + id + ": " + what;
+  const plist::Value complete(plist::Dict{{"title", "T"}, {"bundleVersion", "1"}});
+  const std::string noDirectory = "Failed to create app directory";
+  enum Left { kNothing, kDirectoryAndIcon, kAll };
+  struct Case {
+    const char* name;
+    std::optional<plist::Value> metadata;  // absent: bytes that are no property list
+    std::string id;
+    std::function<void(PlaceholderDevice&)> setup;
+    // The transaction-log entry; the directory operation and its caller each log theirs.
+    std::string scenario;
+    // Prefixes of the messages, all of one level; "DIR" stands for the placeholder directory.
+    std::vector<std::string> messages;
+    LogLevel level = LogLevel::Default;
+    bool finalMessage = true;
+    Left left = kNothing;
   };
-  const FailureCase cases[] = {
-      {.name = "not a property list",
-       .metadata = std::nullopt,
-       .scenarios = {entry(kID, "Failed to parse caravel metadata")},
-       .messages = {{"failed to parse caravel metadata for 'com.example.app'. err=Error "
-                     "Domain=PropertyListError Code=1",
-                     LogLevel::Default}},
-       .finalMessage = false},
-      {.name = "not a dictionary",
-       .metadata = plist::Value(plist::Array{"a"}),
-       .scenarios = {entry(kID, "Failed to parse caravel metadata")},
-       .messages = {{"failed to parse caravel metadata for 'com.example.app'. err=",
-                     LogLevel::Default}},
-       .finalMessage = false},
-      {.name = "no bundleVersion",
-       .metadata = plist::Value(plist::Dict{{"title", "T"}}),
-       .scenarios = {entry(kID, "Failed to create placeholder info")},
-       .messages = {{"failed to create placeholder info at DIR/Info.plist with info {",
-                     LogLevel::Default}},
-       .directoryLeft = true,
-       .iconLeft = true},
-      {.name = "no name",
-       .metadata = plist::Value(plist::Dict{{"bundleVersion", "1"}}),
-       .scenarios = {entry(kID, "Failed to create placeholder info")},
-       .messages = {{"failed to create placeholder info at DIR/Info.plist with info {",
-                     LogLevel::Default}},
-       .directoryLeft = true,
-       .iconLeft = true},
-      {.name = "directory cannot be made",
-       .metadata = plist::Value(complete),
-       .scenarios = {entry(kID, "Failed to create app directory"),
-                     entry(kID, "Failed to create app directory")},
-       .messages = {{"Created app directory for 'com.example.app' at DIR with err=Error "
-                     "Domain=POSIX Code=20",
-                     LogLevel::Default},
-                    {"failed to create app directory for 'com.example.app'. err=(null)",
-                     LogLevel::Default}},
-       .setup =
+  const Case cases[] = {
+      Case("not a property list", std::nullopt, kID, nullptr, "Failed to parse caravel metadata",
+           {"failed to parse caravel metadata for 'com.example.app'. err=Error "
+            "Domain=PropertyListError Code=1"},
+           LogLevel::Default, false),
+      Case("not a dictionary", plist::Value(plist::Array{"a"}), kID, nullptr,
+           "Failed to parse caravel metadata",
+           {"failed to parse caravel metadata for 'com.example.app'. err="}, LogLevel::Default,
+           false),
+      Case("no bundleVersion", plist::Value(plist::Dict{{"title", "T"}}), kID, nullptr,
+           "Failed to create placeholder info",
+           {"failed to create placeholder info at DIR/Info.plist with info {"}, LogLevel::Default,
+           true, kDirectoryAndIcon),
+      Case("no name", plist::Value(plist::Dict{{"bundleVersion", "1"}}), kID, nullptr,
+           "Failed to create placeholder info",
+           {"failed to create placeholder info at DIR/Info.plist with info {"}, LogLevel::Default,
+           true, kDirectoryAndIcon),
+      Case("directory cannot be made", complete, kID,
            [](PlaceholderDevice& d) {
              ASSERT_TRUE(writeFileAtomically(d.appsDir(), plist::Bytes{'x'}));
-           }},
-      {.name = "identifier that would escape",
-       .metadata = plist::Value(complete),
-       .scenarios = {entry("../x", "Failed to create app directory"),
-                     entry("../x", "Failed to create app directory")},
-       .messages = {{"Created app directory for '../x' at (null) with err=Error Domain=POSIX "
-                     "Code=22",
-                     LogLevel::Default},
-                    {"failed to create app directory for '../x'. err=(null)", LogLevel::Default}},
-       .id = "../x",
-       // With the base directory present, "../x.app" would land beside it.
-       .setup = [](PlaceholderDevice& d) { ASSERT_TRUE(createDirectories(d.appsDir())); }},
-      {.name = "registry refuses",
-       .metadata = plist::Value(complete),
-       .scenarios = {entry(kID, "Failed to install placeholder")},
-       .messages = {{"Placeholder app install failed from path DIR: T [com.example.app 1] "
-                     "[isGazette: 0]",
-                     LogLevel::Error}},
-       .setup =
-           [](PlaceholderDevice& d) {
-             d.device.ar().failOperation("installApplication:withOptions:");
            },
-       .directoryLeft = true,
-       .iconLeft = true,
-       .infoLeft = true,
-       .installCalls = 1},
+           noDirectory,
+           {"Created app directory for 'com.example.app' at DIR with err=Error Domain=POSIX "
+            "Code=20",
+            "failed to create app directory for 'com.example.app'. err=(null)"}),
+      // With the base directory present, "../x.app" would land beside it.
+      Case("identifier that would escape", complete, "../x",
+           [](PlaceholderDevice& d) { ASSERT_TRUE(createDirectories(d.appsDir())); }, noDirectory,
+           {"Created app directory for '../x' at (null) with err=Error Domain=POSIX Code=22",
+            "failed to create app directory for '../x'. err=(null)"}),
+      Case(
+          "registry refuses", complete, kID,
+          [](PlaceholderDevice& d) {
+            d.device.ar().failOperation("installApplication:withOptions:");
+          },
+          "Failed to install placeholder",
+          {"Placeholder app install failed from path DIR: T [com.example.app 1] [isGazette: 0]"},
+          LogLevel::Error, true, kAll),
   };
-  for (const FailureCase& c : cases) {
+  for (const Case& c : cases) {
     SCOPED_TRACE(c.name);
     PlaceholderDevice d;
     if (c.setup) c.setup(d);
     const std::string dir = d.placeholderDir(c.id);
-    const plist::Bytes bytes = c.metadata ? testing::binaryPlist(*c.metadata)
-                                          : plist::Bytes{'n', 'o', 't', ' ', 'a', ' ', 'p'};
+    const plist::Bytes bytes =
+        c.metadata ? testing::binaryPlist(*c.metadata) : plist::Bytes{'n', 'o', 't'};
 
     EXPECT_FALSE(d.client._processCaravelRestoreInfoForApp(c.id, bytes, kSinf, kIcon));
 
-    EXPECT_EQ(d.scenarios(), c.scenarios);
-    for (const auto& [message, level] : c.messages) {
-      std::string prefix = message;
+    const std::string entry = "Caravel App Restore no " + c.id + ": " + c.scenario;
+    EXPECT_EQ(d.scenarios(), std::vector<std::string>(c.scenario == noDirectory ? 2 : 1, entry));
+    for (std::string prefix : c.messages) {
       if (auto at = prefix.find("DIR"); at != std::string::npos) prefix.replace(at, 3, dir);
-      expectOneLine(d.device.log(), pluginLine(prefix), level);
+      expectOneLine(d.device.log(), pluginLine(prefix), c.level);
     }
     const std::string finalPrefix =
         pluginLine("failed to process app restore info for '" + c.id + "'. ");
@@ -263,10 +186,10 @@ TEST(RestorePlaceholderTest, FailuresStopWhereTheyHappen) {
     } else {
       EXPECT_TRUE(testing::linesStartingWith(d.device.log(), finalPrefix).empty());
     }
-    EXPECT_EQ(directoryExists(dir), c.directoryLeft);
-    EXPECT_EQ(fileExists(dir + "/Icon.png"), c.iconLeft);
-    EXPECT_EQ(fileExists(dir + "/Info.plist"), c.infoLeft);
-    EXPECT_EQ(d.device.ar().installCalls().size(), c.installCalls);
+    EXPECT_EQ(directoryExists(dir), c.left != kNothing);
+    EXPECT_EQ(fileExists(dir + "/Icon.png"), c.left != kNothing);
+    EXPECT_EQ(fileExists(dir + "/Info.plist"), c.left == kAll);
+    EXPECT_EQ(d.device.ar().installCalls().size(), c.left == kAll ? 1u : 0u);
     EXPECT_FALSE(d.device.ar().application(c.id));
     EXPECT_TRUE(testing::linesStartingWith(d.device.log(), pluginLine("Installed")).empty());
   }
@@ -278,10 +201,10 @@ TEST(RestorePlaceholderTest, SecondAttemptRewritesInPlace) {
     return testing::binaryPlist(plist::Dict{{"title", "T"}, {"bundleVersion", version}});
   };
   ASSERT_TRUE(d.client._processCaravelRestoreInfoForApp(kID, metadata("1"), kSinf, kIcon));
-  const plist::Bytes newIcon = {9, 9};
-  ASSERT_TRUE(d.client._processCaravelRestoreInfoForApp(kID, metadata("2"), kSinf, newIcon));
+  ASSERT_TRUE(
+      d.client._processCaravelRestoreInfoForApp(kID, metadata("2"), kSinf, plist::Bytes{9, 9}));
   const std::string dir = d.placeholderDir(kID);
-  EXPECT_EQ(readFile(dir + "/Icon.png"), newIcon);
+  EXPECT_EQ(readFile(dir + "/Icon.png"), (plist::Bytes{9, 9}));
   EXPECT_EQ(*testing::readDict(dir + "/Info.plist")->find("BNBundleVersion"), plist::Value("2"));
   EXPECT_EQ(d.device.ar().application(kID)->version, "2");
 }

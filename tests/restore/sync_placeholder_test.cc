@@ -52,13 +52,7 @@ TEST(SyncPlaceholderTest, InstallsWithTheThreeSyncOptions) {
   EXPECT_EQ(calls[0].options, (plist::Dict{{"PackageType", "Placeholder"},
                                            {"BNBundleIdentifier", "com.example.sync"},
                                            {"ARInstallType", 4u}}));
-  auto record = d.device.ar().application("com.example.sync");
-  ASSERT_TRUE(record);
-  EXPECT_TRUE(record->isPlaceholder);
-  EXPECT_EQ(record->installType, 4u);
-  EXPECT_EQ(record->name, "Synced");
-  EXPECT_EQ(record->version, "4.5");
-  EXPECT_EQ(record->iconPath, dir + "/Icon.png");
+  EXPECT_EQ(d.device.ar().application("com.example.sync")->installType, 4u);
 
   EXPECT_EQ(d.scenarios(), std::vector<std::string>{
                                "Install placeholder yes com.example.sync: Installed placeholder"});
@@ -78,15 +72,10 @@ TEST(SyncPlaceholderTest, SecondAttemptLogsTheCopyFailureAndStillInstalls) {
   auto again = d.asset("a", "A", plist::Value("2"), {});
   d.client._createPlaceHolderApplication(again);
 
-  auto copyErrors = testing::linesStartingWith(
-      d.device.log(), pluginLine("Copying icon from " + *again->icon() + " to " + dir +
-                                 "/Icon.png failed: Error Domain=POSIX Code=17 "));
-  EXPECT_EQ(copyErrors.size(), 1u);
-  for (const auto& line : d.device.log().lines()) {
-    if (line.message.find("Copying icon") != std::string::npos) {
-      EXPECT_EQ(line.level, LogLevel::Error);
-    }
-  }
+  testing::expectOneLine(d.device.log(),
+                         pluginLine("Copying icon from " + *again->icon() + " to " + dir +
+                                    "/Icon.png failed: Error Domain=POSIX Code=17 "),
+                         LogLevel::Error);
   EXPECT_EQ(*testing::readDict(dir + "/Info.plist")->find("BNBundleVersion"), plist::Value("2"));
   EXPECT_EQ(readFile(dir + "/Icon.png"), kIcon);
   EXPECT_EQ(d.device.ar().installCalls().size(), 2u);
@@ -124,31 +113,29 @@ TEST(SyncPlaceholderTest, StopsBeforeTheRegistry) {
 }
 
 TEST(SyncPlaceholderTest, DirectoryFailureAndRegistryRefusal) {
-  {
+  for (bool registryRefuses : {false, true}) {
+    SCOPED_TRACE(registryRefuses ? "registry refuses" : "directory cannot be made");
     SyncDevice d;
-    ASSERT_TRUE(writeFileAtomically(d.appsDir(), plist::Bytes{'x'}));
+    if (registryRefuses) {
+      d.device.ar().failOperation("installApplication:withOptions:");
+    } else {
+      ASSERT_TRUE(writeFileAtomically(d.appsDir(), plist::Bytes{'x'}));
+    }
     d.client._createPlaceHolderApplication(d.asset("a", "A", plist::Value("1"), {}));
-    // Only the directory operation's entry: this road adds none of its own.
+    // The directory failure has only the directory operation's entry: this road adds none.
     EXPECT_EQ(d.scenarios(),
-              std::vector<std::string>{"Caravel App Restore no a: Failed to create app directory"});
-    EXPECT_TRUE(d.device.ar().installCalls().empty());
-  }
-  {
-    SyncDevice d;
-    d.device.ar().failOperation("installApplication:withOptions:");
-    d.client._createPlaceHolderApplication(d.asset("a", "A", plist::Value("1"), {}));
-    EXPECT_EQ(d.scenarios(),
-              std::vector<std::string>{"Install placeholder no a: Failed to install placeholder"});
+              std::vector<std::string>{
+                  registryRefuses ? "Install placeholder no a: Failed to install placeholder"
+                                  : "Caravel App Restore no a: Failed to create app directory"});
+    EXPECT_EQ(d.device.ar().installCalls().size(), registryRefuses ? 1u : 0u);
+    EXPECT_FALSE(d.device.ar().application("a"));
     const std::string failed = pluginLine("Placeholder app install failed from path " +
                                           d.placeholderDir("a") + ": A [a 1] [isGazette: 0]");
-    std::size_t seen = 0;
-    for (const auto& line : d.device.log().lines()) {
-      if (line.message != failed) continue;
-      ++seen;
-      EXPECT_EQ(line.level, LogLevel::Error);
+    if (registryRefuses) {
+      testing::expectOneLine(d.device.log(), failed, LogLevel::Error);
+    } else {
+      EXPECT_TRUE(testing::linesStartingWith(d.device.log(), failed).empty());
     }
-    EXPECT_EQ(seen, 1u);
-    EXPECT_FALSE(d.device.ar().application("a"));
   }
 }
 

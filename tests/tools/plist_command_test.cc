@@ -14,55 +14,42 @@ namespace {
 
 using testing::writeText;
 
-TEST(PlistCommandTest, LintNamesTheBadFileAndThePlace) {
+TEST(PlistCommandTest, LintNamesTheBadFileAndThePlaceAndConvertRoundTrips) {
   const char* host = std::getenv("APPSYNC_HOST");
   ASSERT_NE(host, nullptr) << "APPSYNC_HOST is not set";
   testing::TempDir dir;
+  const auto run = [&](const std::string& arguments) {
+    return testing::runHost(host, "plist " + arguments, dir.path());
+  };
   writeText(dir / "good.plist", "<?xml version=\"1.0\"?><plist><array><true/></array></plist>");
   writeText(dir / "bad.plist",
             "<?xml version=\"1.0\"?>\n<plist><dict><key>a</key><integer>12abc</integer></dict>"
             "</plist>");
+  auto lint = run("lint '" + (dir / "good.plist") + "'");
+  EXPECT_EQ(lint.status, 0) << lint.stderrText;
+  EXPECT_NE(lint.stdoutText.find("good.plist: ok (xml)"), std::string::npos) << lint.stdoutText;
+  lint = run("lint '" + (dir / "good.plist") + "' '" + (dir / "bad.plist") + "' '" +
+             (dir / "missing.plist") + "'");
+  EXPECT_EQ(lint.status, 1);
+  for (const char* part :
+       {"bad.plist: XML property list, line 2", "12abc", "missing.plist: cannot read"}) {
+    EXPECT_NE(lint.stderrText.find(part), std::string::npos) << lint.stderrText;
+  }
 
-  auto run = testing::runHost(host, "plist lint '" + (dir / "good.plist") + "'", dir.path());
-  EXPECT_EQ(run.status, 0) << run.stderrText;
-  EXPECT_NE(run.stdoutText.find("good.plist: ok (xml)"), std::string::npos) << run.stdoutText;
-
-  run = testing::runHost(host,
-                         "plist lint '" + (dir / "good.plist") + "' '" + (dir / "bad.plist") +
-                             "' '" + (dir / "missing.plist") + "'",
-                         dir.path());
-  EXPECT_EQ(run.status, 1);
-  EXPECT_NE(run.stderrText.find("bad.plist: XML property list, line 2"), std::string::npos)
-      << run.stderrText;
-  EXPECT_NE(run.stderrText.find("12abc"), std::string::npos) << run.stderrText;
-  EXPECT_NE(run.stderrText.find("missing.plist: cannot read"), std::string::npos)
-      << run.stderrText;
-}
-
-TEST(PlistCommandTest, ConvertRoundTripsBetweenFormats) {
-  const char* host = std::getenv("APPSYNC_HOST");
-  ASSERT_NE(host, nullptr) << "APPSYNC_HOST is not set";
-  testing::TempDir dir;
-  plist::Dict record{{"identifier", "com.example.é"}, {"operation", "install"}, {"n", 7}};
-  ASSERT_TRUE(writePlistAtomically(dir / "in.plist", plist::Value(plist::Array{record}),
-                                   plist::Format::Xml));
-
-  for (const char* to : {"binary", "xml"}) {
+  const plist::Value list(plist::Array{plist::Dict{{"identifier", "com.example.é"}, {"n", 7}}});
+  ASSERT_TRUE(writePlistAtomically(dir / "in.plist", list, plist::Format::Xml));
+  for (auto [to, format] :
+       {std::pair{"binary", plist::Format::Binary}, {"xml", plist::Format::Xml}}) {
     SCOPED_TRACE(to);
     const std::string out = dir / (std::string("out.") + to);
-    auto run = testing::runHost(host,
-                                std::string("plist convert --to ") + to + " '" +
-                                    (dir / "in.plist") + "' -o '" + out + "'",
-                                dir.path());
-    ASSERT_EQ(run.status, 0) << run.stderrText;
-    plist::Format format;
-    auto value = plist::parse(readFile(out).value_or(plist::Bytes{}), nullptr, &format);
-    ASSERT_TRUE(value);
-    EXPECT_EQ(format, std::string(to) == "xml" ? plist::Format::Xml : plist::Format::Binary);
-    EXPECT_EQ(*value, plist::Value(plist::Array{record}));
+    const auto convert =
+        run(std::string("convert --to ") + to + " '" + (dir / "in.plist") + "' -o '" + out + "'");
+    ASSERT_EQ(convert.status, 0) << convert.stderrText;
+    plist::Format written;
+    EXPECT_EQ(plist::parse(readFile(out).value_or(plist::Bytes{}), nullptr, &written), list);
+    EXPECT_EQ(written, format);
   }
-  auto run = testing::runHost(host, "plist convert --to yaml in -o out", dir.path());
-  EXPECT_NE(run.status, 0);
+  EXPECT_NE(run("convert --to yaml in -o out").status, 0);
 }
 
 }  // namespace

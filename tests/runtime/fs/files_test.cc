@@ -46,14 +46,7 @@ void expectPOSIXError(const ErrorRef& error, int code, const std::string& path) 
   EXPECT_EQ(*named, path);
 }
 
-TEST(ReadFileTest, MissingFileIsAPOSIXError) {
-  testing::TempDir dir;
-  ErrorRef error;
-  EXPECT_FALSE(readFile(dir / "missing.plist", &error));
-  expectPOSIXError(error, ENOENT, dir / "missing.plist");
-}
-
-TEST(WriteFileAtomicallyTest, ReplacesContentKeepsModeAndLeavesNoTemporaryFile) {
+TEST(WriteFileAtomicallyTest, ReplacesContentKeepsModeAndLeavesNoTemporaryFileAndReadsBack) {
   testing::TempDir dir;
   std::string path = dir / "state.plist";
   ASSERT_TRUE(writeFileAtomically(path, bytesOf("one")));
@@ -67,6 +60,10 @@ TEST(WriteFileAtomicallyTest, ReplacesContentKeepsModeAndLeavesNoTemporaryFile) 
   ASSERT_TRUE(writeFileAtomically(path, {}));
   EXPECT_EQ(contentOf(path), "");
   EXPECT_EQ(namesIn(dir.path()), std::vector<std::string>{"state.plist"});
+
+  ErrorRef error;
+  EXPECT_FALSE(readFile(dir / "missing.plist", &error));
+  expectPOSIXError(error, ENOENT, dir / "missing.plist");
 }
 
 TEST(WriteFileAtomicallyTest, FailuresLeaveTheOldFileIntact) {

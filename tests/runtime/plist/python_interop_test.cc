@@ -3,13 +3,13 @@
 #include <gtest/gtest.h>
 
 #include <cstdio>
-#include <fstream>
-#include <iterator>
 #include <string>
 
+#include "runtime/fs/files.h"
 #include "runtime/plist/codec.h"
 #include "runtime/plist/plist_test_util.h"
 #include "support/temp_dir.h"
+#include "support/text_file.h"
 
 namespace appsync::plist {
 namespace {
@@ -71,55 +71,38 @@ else:
 print("ok")
 )py";
 
-class PythonInteropTest : public ::testing::Test {
- protected:
-  void SetUp() override { std::ofstream(dir_ / "check.py") << kScript; }
-
-  // Runs the script; returns its output (and exit status in the last line when non-zero).
-  std::string runScript(const std::string& command) {
-    std::string line =
-        "python3 '" + (dir_ / "check.py") + "' " + command + " '" + dir_.str() + "' 2>&1";
-    FILE* pipe = ::popen(line.c_str(), "r");
-    if (!pipe) return "cannot run python3";
-    std::string output;
-    char buf[4096];
-    std::size_t n;
-    while ((n = std::fread(buf, 1, sizeof buf, pipe)) > 0) output.append(buf, n);
-    int status = ::pclose(pipe);
-    if (status != 0) output += "\nexit status " + std::to_string(status);
-    return output;
-  }
-
-  void writeFile(const std::string& name, const Bytes& bytes) {
-    std::ofstream(dir_ / name, std::ios::binary)
-        .write(reinterpret_cast<const char*>(bytes.data()),
-               static_cast<std::streamsize>(bytes.size()));
-  }
-
-  Bytes readFile(const std::string& name) {
-    std::ifstream in(dir_ / name, std::ios::binary);
-    return Bytes(std::istreambuf_iterator<char>(in), std::istreambuf_iterator<char>());
-  }
-
-  appsync::testing::TempDir dir_;
-};
-
-TEST_F(PythonInteropTest, PythonReadsWhatWeWrite) {
-  writeFile("ours.xml", *write(testing::everyType(), Format::Xml));
-  writeFile("ours.bplist", *write(testing::everyType(), Format::Binary));
-  EXPECT_EQ(runScript("read"), "ok\n");
+// Runs the script; returns its output, and its exit status in the last line when not zero.
+std::string runScript(const appsync::testing::TempDir& dir, const std::string& command) {
+  appsync::testing::writeText(dir / "check.py", kScript);
+  const std::string line =
+      "python3 '" + (dir / "check.py") + "' " + command + " '" + dir.str() + "' 2>&1";
+  FILE* pipe = ::popen(line.c_str(), "r");
+  if (!pipe) return "cannot run python3";
+  std::string output;
+  char buf[4096];
+  for (std::size_t n; (n = std::fread(buf, 1, sizeof buf, pipe)) > 0;) output.append(buf, n);
+  const int status = ::pclose(pipe);
+  return status == 0 ? output : output + "\nexit status " + std::to_string(status);
 }
 
-TEST_F(PythonInteropTest, WeReadWhatPythonWrites) {
-  ASSERT_EQ(runScript("write"), "ok\n");
-  ParseError error;
-  Format format;
-  EXPECT_EQ(parse(readFile("python.xml"), &error, &format), testing::everyTypeAsXmlReadsIt())
-      << error.message;
-  EXPECT_EQ(format, Format::Xml);
-  EXPECT_EQ(parse(readFile("python.bplist"), &error, &format), testing::everyType())
-      << error.message;
-  EXPECT_EQ(format, Format::Binary);
+TEST(PythonInteropTest, PythonReadsWhatWeWriteAndWeReadWhatPythonWrites) {
+  appsync::testing::TempDir dir;
+  ASSERT_TRUE(writeFileAtomically(dir / "ours.xml", *write(testing::everyType(), Format::Xml)));
+  ASSERT_TRUE(
+      writeFileAtomically(dir / "ours.bplist", *write(testing::everyType(), Format::Binary)));
+  EXPECT_EQ(runScript(dir, "read"), "ok\n");
+
+  ASSERT_EQ(runScript(dir, "write"), "ok\n");
+  for (auto [name, format] :
+       {std::pair{"python.xml", Format::Xml}, {"python.bplist", Format::Binary}}) {
+    SCOPED_TRACE(name);
+    ParseError error;
+    Format detected;
+    EXPECT_EQ(parse(readFile(dir / name).value_or(Bytes{}), &error, &detected),
+              format == Format::Xml ? testing::everyTypeAsXmlReadsIt() : testing::everyType())
+        << error.message;
+    EXPECT_EQ(detected, format);
+  }
 }
 
 }  // namespace

@@ -1,5 +1,4 @@
 // Property-list values: dictionary order and indexing, truth values, descriptions.
-#include "runtime/plist/codec.h"
 #include "runtime/plist/value.h"
 
 #include <gtest/gtest.h>
@@ -8,6 +7,8 @@
 #include <limits>
 #include <string>
 #include <vector>
+
+#include "runtime/plist/codec.h"
 
 namespace appsync::plist {
 namespace {
@@ -56,38 +57,13 @@ TEST(DictTest, KeepsOrderThroughReplaceEraseAndIndexing) {
 }
 
 TEST(ValueTest, TruthValue) {
-  struct Case {
-    Value value;
-    std::optional<bool> expected;
+  const std::pair<std::optional<bool>, std::vector<Value>> cases[] = {
+      {true, {true, -3, 0.5, "YES", "yes", "true", "T", "  \t 7", "-0001"}},
+      {false, {false, 0, 0.0, "no", "false", "", "+0", "000", "0.5", "x"}},
+      {std::nullopt, {Bytes{1}, Date{1}, Uid{1}, Array{true}, Dict{}, Value::null()}},
   };
-  const Case cases[] = {
-      {true, true},
-      {false, false},
-      {0, false},
-      {-3, true},
-      {0.0, false},
-      {0.5, true},
-      {"YES", true},
-      {"yes", true},
-      {"true", true},
-      {"T", true},
-      {"no", false},
-      {"false", false},
-      {"", false},
-      {"  \t 7", true},
-      {"-0001", true},
-      {"+0", false},
-      {"000", false},
-      {"0.5", false},
-      {"x", false},
-      {Bytes{1}, std::nullopt},
-      {Date{1}, std::nullopt},
-      {Uid{1}, std::nullopt},
-      {Array{true}, std::nullopt},
-      {Dict{}, std::nullopt},
-  };
-  for (const Case& c : cases) {
-    EXPECT_EQ(c.value.truthValue(), c.expected) << c.value.describe();
+  for (const auto& [expected, values] : cases) {
+    for (const Value& v : values) EXPECT_EQ(v.truthValue(), expected) << v.describe();
   }
 }
 
@@ -113,46 +89,28 @@ TEST(ValueTest, Describe) {
       {Uid{7}, "<uid 7>"},
       {Array{1, "a b", Array{}}, "(1, \"a b\", ())"},
       {Dict{{"b", 1}, {"a", Dict{{"x", false}}}}, "{b = 1; a = {x = 0;};}"},
+      {Value::null(), "<null>"},
   };
   for (const Case& c : cases) EXPECT_EQ(c.value.describe(), c.expected);
 }
 
 TEST(ValueTest, IntegersKeepSignedness) {
-  Value big(std::numeric_limits<std::uint64_t>::max());
-  EXPECT_EQ(big.int64(), std::nullopt);
-  EXPECT_EQ(big.uint64(), std::numeric_limits<std::uint64_t>::max());
-  Value negative(-1);
-  EXPECT_EQ(negative.uint64(), std::nullopt);
-  EXPECT_EQ(negative.number(), -1.0);
+  EXPECT_EQ(Value(std::numeric_limits<std::uint64_t>::max()).int64(), std::nullopt);
+  EXPECT_EQ(Value(-1).uint64(), std::nullopt);
   // The same bits, one signed and one unsigned, are different values.
   EXPECT_NE(Value(Integer{~0ull, false}), Value(Integer{~0ull, true}));
   EXPECT_EQ(Value(std::uint64_t{5}), Value(5));
 }
 
-}  // namespace
-}  // namespace appsync::plist
-
-namespace appsync::plist {
-namespace {
-
-TEST(NullValueTest, WritersRefuseNullWhereverItStands) {
-  const std::vector<Value> values = {
-      Value::null(),
-      Value(Array{1, Value::null()}),
-      Value(Dict{{"SINF", Value::null()}, {"name", "x"}}),
-  };
-  for (const Value& v : values) {
-    SCOPED_TRACE(v.describe());
-    std::string error;
-    EXPECT_FALSE(writeBinary(v, &error));
-    EXPECT_NE(error.find("cannot carry null"), std::string::npos) << error;
-    error.clear();
-    EXPECT_FALSE(writeXml(v, &error));
-    EXPECT_NE(error.find("cannot carry null"), std::string::npos) << error;
+TEST(ValueTest, WritersRefuseNullWhereverItStands) {
+  for (const Value& v : {Value::null(), Value(Array{1, Value::null()}),
+                         Value(Dict{{"SINF", Value::null()}, {"name", "x"}})}) {
+    for (Format format : {Format::Binary, Format::Xml}) {
+      std::string error;
+      EXPECT_FALSE(write(v, format, &error)) << v.describe();
+      EXPECT_NE(error.find("cannot carry null"), std::string::npos) << error;
+    }
   }
-  EXPECT_EQ(Value::null().describe(), "<null>");
-  EXPECT_TRUE(Value::null().isNull());
-  EXPECT_EQ(Value::null().truthValue(), std::nullopt);
 }
 
 }  // namespace

@@ -1,12 +1,19 @@
-// The message formatter: every specifier the plugin uses, with present, absent, missing and
-// mismatched arguments.
+// Logging: the message formatter's specifiers, levels that are switched off costing nothing,
+// and the file sink's lines.
+#include "runtime/log/log.h"
+
 #include <gtest/gtest.h>
 
+#include <atomic>
+#include <fstream>
+#include <memory>
 #include <optional>
+#include <regex>
+#include <sstream>
 #include <string>
 #include <vector>
 
-#include "runtime/log/log.h"
+#include "support/temp_dir.h"
 
 namespace appsync {
 namespace {
@@ -63,6 +70,55 @@ TEST(FormatLogMessageTest, EverySpecifier) {
   for (const FormatCase& c : cases) {
     EXPECT_EQ(formatLogMessage(c.format, c.args), c.expected) << "format: " << c.format;
   }
+}
+
+// An argument that counts how often it was asked to describe itself.
+struct CountingObject {
+  std::atomic<int>* describes;
+  std::string describe() const {
+    ++*describes;
+    return "counted";
+  }
+};
+
+TEST(LoggerTest, DisabledLevelsFormatNothing) {
+  Logger logger;
+  auto sink = std::make_shared<MemoryLogSink>();
+  logger.setSink(sink);
+  std::atomic<int> describes{0};
+  CountingObject object{&describes};
+  LogCategory& category = logger.category(8);
+  logger.setLevelEnabled(LogLevel::Default, false);
+  pluginLog(category, LogLevel::Default, "%s|%{public}@", object);
+  EXPECT_EQ(describes.load(), 0);
+  pluginLog(category, LogLevel::Error, "%s|%{public}@", object);
+  EXPECT_EQ(describes.load(), 1);
+
+  logger.setLevelEnabled(LogLevel::Error, false);
+  logger.setLevelEnabled(LogLevel::Default, true);
+  logMessage(category, LogLevel::Error, "%{public}@", object);
+  category.write(LogLevel::Error, "preformatted");
+  EXPECT_EQ(describes.load(), 1);
+  EXPECT_EQ(sink->messages(), std::vector<std::string>{"com.vantor.trc.AppSync|counted"});
+}
+
+TEST(FileLogSinkTest, WritesOneEscapedLinePerMessage) {
+  testing::TempDir dir;
+  std::string path = dir / "appsync.log";
+  {
+    FileLogSink sink(path);
+    ASSERT_TRUE(sink.ok());
+    sink.write(8, LogLevel::Default, "com.vantor.trc.AppSync|Nothing to do");
+    sink.write(14, LogLevel::Error, "first\nsecond\\third\n");
+  }
+  FileLogSink(path).write(0, LogLevel::Default, "appended");
+  std::stringstream text;
+  text << std::ifstream(path).rdbuf();
+  const std::string stamp = R"(\d{4}-\d\d-\d\dT\d\d:\d\d:\d\d\.\d{3}Z)";
+  std::regex pattern(stamp + "\t8\tDefault\tcom\\.vantor\\.trc\\.AppSync\\|Nothing to do\n" +
+                     stamp + "\t14\tError\tfirst\\\\nsecond\\\\third\\\\n\n" + stamp +
+                     "\t0\tDefault\tappended\n");
+  EXPECT_TRUE(std::regex_match(text.str(), pattern)) << text.str();
 }
 
 }  // namespace
