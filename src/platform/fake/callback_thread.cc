@@ -45,7 +45,11 @@ void CallbackThread::drain() {
 void CallbackThread::waitUntilIdle() {
   if (isCurrent()) return;
   std::unique_lock lock(mutex_);
-  changed_.wait(lock, [&] { return !running_; });
+  // Waits for the callback running now only: under a steady stream of callbacks the thread may
+  // never be seen idle again.
+  if (!running_) return;
+  const std::uint64_t target = finished_ + 1;
+  changed_.wait(lock, [&] { return finished_ >= target; });
 }
 
 void CallbackThread::hold() {

@@ -33,8 +33,8 @@ class CallbackThread {
   // waits for release(). Calling it from the thread itself is a programming error and aborts.
   void drain();
 
-  // Blocks until no callback is running at this moment (queued ones may remain). Returns at
-  // once when called from the thread itself. Used to guarantee that a callback that has already
+  // Blocks until the callback running at this moment, if any, has finished (queued ones may
+  // remain, and may be running by then). Returns at once when called from the thread itself. Used to guarantee that a callback that has already
   // started has also finished.
   void waitUntilIdle();
 
