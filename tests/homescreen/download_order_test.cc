@@ -110,6 +110,7 @@ TEST(DownloadOrderTest, PlacesItemsByIconOrderThenTheRestByIdentifier) {
     EXPECT_EQ(device.log().messages(), expected);
     for (const auto& line : device.log().lines()) EXPECT_EQ(line.level, LogLevel::Default);
     EXPECT_EQ(device.pv().outstandingBuffers(), 0u);
+    EXPECT_EQ(device.pv().lastFlattenedIconStateFlags(), 1);  // the client always asks with 1
     const bool isSaved = c.iconState && !c.homeScreenFails && c.workAreaExists;
     EXPECT_EQ(readFile(device.paths().assetSortOrder()),
               isSaved ? c.iconState : std::optional<plist::Bytes>());

@@ -47,6 +47,13 @@ class TodoListTest : public ::testing::Test {
     return value && value->array() ? *value->array() : plist::Array{};
   }
   std::vector<std::string> messages() { return tr.logSink()->messages(); }
+  // Every line so far has `level` and the plugin's category.
+  void expectAllAt(LogLevel level) {
+    for (const auto& line : tr.logSink()->lines()) {
+      EXPECT_EQ(line.level, level) << line.message;
+      EXPECT_EQ(line.category, 8) << line.message;
+    }
+  }
 
   testing::TempDir dir;
   std::string path = dir / "ApplicationsSync.plist";
@@ -68,6 +75,7 @@ TEST_F(TodoListTest, ChangesTheFirstMatchingRecordAndWritesBinary) {
                                               record("com.a", "remove")}));
   EXPECT_EQ(messages(), std::vector<std::string>{
                             "com.vantor.trc.AppSync|Changing com.a from install to DOWNLOADED"});
+  expectAllAt(LogLevel::Default);
 }
 
 TEST_F(TodoListTest, UnknownKeysAndTypesSurvive) {
@@ -112,6 +120,7 @@ TEST_F(TodoListTest, NothingIsWrittenWhenNothingMatchesOrTheListIsUnusable) {
     todo.changeAssetID("com.a", "FAILED");
     EXPECT_EQ(bytes(), before);
     EXPECT_EQ(messages(), c.messages);
+    expectAllAt(LogLevel::Error);
   }
   tr.logSink()->clear();
   removeFile(path);
@@ -148,6 +157,7 @@ TEST_F(TodoListTest, LoadersAcceptBothFormatsAndReportWrongRoots) {
   EXPECT_EQ(AppsClient::_loadDemotedAppsPlist(tr, path, nullptr), std::nullopt);
   EXPECT_EQ(messages(), std::vector<std::string>{
                             "com.vantor.trc.AppSync|demoted apps list is not a dictionary"});
+  expectAllAt(LogLevel::Error);
 
   tr.logSink()->clear();
   writeRaw("not a plist");
@@ -156,6 +166,7 @@ TEST_F(TodoListTest, LoadersAcceptBothFormatsAndReportWrongRoots) {
   ASSERT_NE(error, nullptr);
   EXPECT_EQ(messages(), std::vector<std::string>{
                             "com.vantor.trc.AppSync|couldn't parse demoted apps list"});
+  expectAllAt(LogLevel::Error);
 
   error.reset();
   EXPECT_EQ(AppsClient::_loadPlist(tr, dir / "missing.plist", &error), std::nullopt);

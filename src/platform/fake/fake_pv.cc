@@ -80,8 +80,17 @@ int FakePVHomeScreen::PVSetIconState(PVPort port, const std::uint8_t* bytes, std
   return 0;
 }
 
-int FakePVHomeScreen::PVGetFlattenedIconState(PVPort port, int /*flags*/, PVBuffer* buffer,
+std::optional<int> FakePVHomeScreen::lastFlattenedIconStateFlags() const {
+  std::lock_guard lock(mutex_);
+  return lastFlags_;
+}
+
+int FakePVHomeScreen::PVGetFlattenedIconState(PVPort port, int flags, PVBuffer* buffer,
                                               std::uint32_t* length) {
+  {
+    std::lock_guard lock(mutex_);
+    lastFlags_ = flags;
+  }
   if (ErrorRef failure = beginCall(kGetIconState)) return static_cast<int>(statusFor(failure));
   if (port != port_) return kStatusInvalidPort;
   std::optional<plist::Bytes> bytes;

@@ -34,6 +34,9 @@ class FakePVHomeScreen final : public PVHomeScreen, public FakeService {
   void setFlattenedIconState(std::optional<plist::Bytes> bytes);
   // Sets the icon state to a binary property list: an array of these identifiers.
   void setIconOrder(const std::vector<std::string>& identifiers);
+  // The flags of the last PVGetFlattenedIconState call (failed calls included); absent before
+  // the first.
+  std::optional<int> lastFlattenedIconStateFlags() const;
   // The last layout given with PVSetIconState.
   std::optional<plist::Bytes> lastIconState() const;
   std::size_t setIconStateCount() const { return callCount("PVSetIconState"); }
@@ -61,6 +64,7 @@ class FakePVHomeScreen final : public PVHomeScreen, public FakeService {
   mutable std::mutex mutex_;
   std::optional<plist::Bytes> flattened_;
   std::optional<plist::Bytes> lastIconState_;
+  std::optional<int> lastFlags_;
   std::map<std::string, std::deque<std::int32_t>> outcomes_;
   std::map<std::string, std::size_t> assertionRequests_;
   // Shared with the buffers and assertions, which may outlive the home screen.
