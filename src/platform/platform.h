@@ -1,6 +1,8 @@
 // Every platform service the client calls, handed to it at construction. No globals.
 #pragma once
 
+#include <type_traits>
+
 #include "runtime/fs/paths.h"
 #include "platform/ar.h"
 #include "platform/bz.h"
@@ -33,52 +35,38 @@ struct Platform {
   const Paths& paths;
 
   // A copy with one service replaced, the others shared: how a test puts a wrapper of one
-  // service in front of an assembled platform.
-  Platform with(TRHostFramework& service) const;
-  Platform with(ARApplicationWorkspace& service) const;
-  Platform with(KCInstallCoordination& service) const;
-  Platform with(EMInstaller& service) const;
-  Platform with(SWBackupService& service) const;
-  Platform with(RSProfileConnection& service) const;
-  Platform with(BZStoreService& service) const;
-  Platform with(PVHomeScreen& service) const;
-  Platform with(QIIconService& service) const;
-  Platform with(AITransactionLog& service) const;
-  Platform with(SystemServices& service) const;
-};
+  // service in front of an assembled platform. `Service` derives from exactly one of the
+  // service interfaces above.
+  template <typename Service>
+  Platform with(Service& service) const {
+    static_assert(
+        (std::is_base_of_v<TRHostFramework, Service> +
+         std::is_base_of_v<ARApplicationWorkspace, Service> +
+         std::is_base_of_v<KCInstallCoordination, Service> +
+         std::is_base_of_v<EMInstaller, Service> + std::is_base_of_v<SWBackupService, Service> +
+         std::is_base_of_v<RSProfileConnection, Service> +
+         std::is_base_of_v<BZStoreService, Service> + std::is_base_of_v<PVHomeScreen, Service> +
+         std::is_base_of_v<QIIconService, Service> + std::is_base_of_v<AITransactionLog, Service> +
+         std::is_base_of_v<SystemServices, Service>) == 1,
+        "with() takes one platform service");
+    return {pick(service, tr),     pick(service, ar),
+            pick(service, kc),     pick(service, em),
+            pick(service, sw),     pick(service, rs),
+            pick(service, bz),     pick(service, pv),
+            pick(service, qi),     pick(service, transactionLog),
+            pick(service, system), paths};
+  }
 
-inline Platform Platform::with(TRHostFramework& service) const {
-  return {service, ar, kc, em, sw, rs, bz, pv, qi, transactionLog, system, paths};
-}
-inline Platform Platform::with(ARApplicationWorkspace& service) const {
-  return {tr, service, kc, em, sw, rs, bz, pv, qi, transactionLog, system, paths};
-}
-inline Platform Platform::with(KCInstallCoordination& service) const {
-  return {tr, ar, service, em, sw, rs, bz, pv, qi, transactionLog, system, paths};
-}
-inline Platform Platform::with(EMInstaller& service) const {
-  return {tr, ar, kc, service, sw, rs, bz, pv, qi, transactionLog, system, paths};
-}
-inline Platform Platform::with(SWBackupService& service) const {
-  return {tr, ar, kc, em, service, rs, bz, pv, qi, transactionLog, system, paths};
-}
-inline Platform Platform::with(RSProfileConnection& service) const {
-  return {tr, ar, kc, em, sw, service, bz, pv, qi, transactionLog, system, paths};
-}
-inline Platform Platform::with(BZStoreService& service) const {
-  return {tr, ar, kc, em, sw, rs, service, pv, qi, transactionLog, system, paths};
-}
-inline Platform Platform::with(PVHomeScreen& service) const {
-  return {tr, ar, kc, em, sw, rs, bz, service, qi, transactionLog, system, paths};
-}
-inline Platform Platform::with(QIIconService& service) const {
-  return {tr, ar, kc, em, sw, rs, bz, pv, service, transactionLog, system, paths};
-}
-inline Platform Platform::with(AITransactionLog& service) const {
-  return {tr, ar, kc, em, sw, rs, bz, pv, qi, service, system, paths};
-}
-inline Platform Platform::with(SystemServices& service) const {
-  return {tr, ar, kc, em, sw, rs, bz, pv, qi, transactionLog, service, paths};
-}
+ private:
+  // `replacement` where it is a `Current`, else `current`.
+  template <typename Current, typename Replacement>
+  static Current& pick(Replacement& replacement, Current& current) {
+    if constexpr (std::is_base_of_v<Current, Replacement>) {
+      return replacement;
+    } else {
+      return current;
+    }
+  }
+};
 
 }  // namespace appsync
