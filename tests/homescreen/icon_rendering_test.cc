@@ -121,10 +121,6 @@ TEST(IconRenderingTest, WritesTheDeviceIconAsOnePng) {
     }
     const std::uint8_t* centre = image->pixel(60, 60);
     EXPECT_EQ(std::vector<int>(centre, centre + 4), (std::vector<int>{30, 144, 255, 255}));
-    int partial = 0;  // somewhere on the diagonal the curve passes through a pixel
-    for (int i = 0; i < 60; ++i)
-      partial += image->pixel(i, i)[3] > 0 && image->pixel(i, i)[3] < 255;
-    EXPECT_GE(partial, 1);
   }
 }
 

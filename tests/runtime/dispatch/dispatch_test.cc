@@ -4,7 +4,6 @@
 
 #include <algorithm>
 #include <atomic>
-#include <future>
 #include <memory>
 #include <mutex>
 #include <string>
@@ -126,19 +125,6 @@ TEST(OperationQueueTest, NeverRunsMoreThanTheLimit) {
   EXPECT_EQ(queue.peakRunningCount(), 10u);
 }
 
-TEST(OperationQueueTest, StartsInOrderAndDrainsOnDestruction) {
-  std::vector<int> order, expected;
-  std::promise<void> go;
-  {
-    OperationQueue queue("serial");
-    queue.addOperation([ready = go.get_future().share()] { ready.wait(); });
-    for (int i = 0; i < 20; ++i) queue.addOperation([&order, i] { order.push_back(i); });
-    go.set_value();  // the others are still queued when the destructor starts
-  }
-  for (int i = 0; i < 20; ++i) expected.push_back(i);
-  EXPECT_EQ(order, expected);
-}
-
 TEST(DelayedWorkQueueTest, RunsOnItsThreadOnceTheClockPassesItsTimeEarliestFirst) {
   ManualClock clock;
   DelayedWorkQueue queue("retry", clock);
@@ -165,21 +151,6 @@ TEST(DelayedWorkQueueTest, RunsOnItsThreadOnceTheClockPassesItsTimeEarliestFirst
   EXPECT_EQ(ran, (std::vector<std::string>{"now", "thirty seconds"}));
   EXPECT_NE(ranOn, std::this_thread::get_id());
   EXPECT_EQ(queue.pendingCount(), 1u);
-}
-
-// Under the system clock: a destructor that waited for the hour would hang the test.
-TEST(DelayedWorkQueueTest, DestructionDropsFutureWorkPromptly) {
-  SystemClock clock;
-  std::atomic<bool> futureRan{false}, asyncRan{false};
-  {
-    DelayedWorkQueue queue("shutdown", clock);
-    queue.async([&] { asyncRan = true; });
-    queue.waitUntilIdle();
-    queue.after(1h, [&] { futureRan = true; });
-    EXPECT_EQ(queue.pendingCount(), 1u);
-  }
-  EXPECT_TRUE(asyncRan.load());
-  EXPECT_FALSE(futureRan.load());
 }
 
 // Each wait's mutex and condition variable die with it, while advances run flat out: an

@@ -120,26 +120,5 @@ TEST(WriteFileAtomicallyTest, FailuresLeaveTheOldFileIntact) {
   }
 }
 
-TEST(WritePlistAtomicallyTest, WritesEitherFormatAndRefusesWhatItCannotCarry) {
-  testing::TempDir dir;
-  plist::Value value(plist::Dict{{"identifier", "com.example.app"}, {"count", 3}});
-  for (plist::Format format : {plist::Format::Binary, plist::Format::Xml}) {
-    std::string path = dir / "value.plist";
-    ASSERT_TRUE(writePlistAtomically(path, value, format));
-    std::optional<plist::Bytes> bytes = readFile(path);
-    ASSERT_TRUE(bytes);
-    plist::Format detected;
-    EXPECT_EQ(plist::parse(*bytes, nullptr, &detected), value);
-    EXPECT_EQ(detected, format);
-  }
-  ErrorRef error;
-  EXPECT_FALSE(writePlistAtomically(dir / "value.plist", plist::Value(std::string("\xff\xfe")),
-                                    plist::Format::Binary, &error));
-  ASSERT_TRUE(error);
-  EXPECT_EQ(error->domain, kPropertyListErrorDomain);
-  EXPECT_EQ(*plist::stringAt(error->userInfo, kErrorPathKey), dir / "value.plist");
-  EXPECT_EQ(namesIn(dir.path()), std::vector<std::string>{"value.plist"});
-}
-
 }  // namespace
 }  // namespace appsync
