@@ -116,7 +116,8 @@ TEST(CodecTest, SharedReferencesWithoutCyclesAreAllowed) {
   // along several paths.
   BplistBuilder b;
   b.objects = {{0xA4, 1, 1, 2, 3}, {0xA1, 2}, {0x51, 's'}, {0xC1, 1}};
-  EXPECT_EQ(parse(b.build()), Value(Array{Array{"s"}, Array{"s"}, "s", Array{Array{"s"}}}));
+  // Value(...) around the inner array: braces around a lone Array would copy it, not nest it.
+  EXPECT_EQ(parse(b.build()), Value(Array{Array{"s"}, Array{"s"}, "s", Array{Value(Array{"s"})}}));
 }
 
 TEST(CodecTest, XmlReaderAcceptsTheUsualForms) {
