@@ -175,6 +175,9 @@ class FakeARWorkspace final : public ARApplicationWorkspace, public FakeService 
   Entry* findLocked(const std::string& identifier);
   const Entry* findLocked(const std::string& identifier) const;
   void putLocked(Entry entry);
+  // Records an installed application (dropping its install progress objects when asked) and
+  // tells the observers.
+  void recordInstalled(Entry entry, bool dropProgress);
   void eraseLocked(const std::string& identifier);
   std::shared_ptr<ARInstallProgress> progressLocked(const std::string& identifier,
                                                     std::uint64_t phase);

@@ -126,16 +126,7 @@ bool FakeARWorkspace::installPlaceholder(const std::string& path, const plist::D
   r.lastInstallOptions = options;
   if (writeMetadata(*container, options)) r.containerDirectory = container;
 
-  std::vector<std::uint64_t> registrations;
-  ARProxyList installed;
-  {
-    std::lock_guard lock(mutex_);
-    installed.push_back(makeApplicationProxy(entry));
-    putLocked(std::move(entry));
-    registrations = registrationsLocked();
-  }
-  postEvent(std::move(registrations),
-            &ARApplicationWorkspaceObserverProtocol::applicationsDidInstall, std::move(installed));
+  recordInstalled(std::move(entry), false);
   return true;
 }
 
@@ -215,18 +206,25 @@ bool FakeARWorkspace::installPackage(const std::string& path, const plist::Dict&
   r.lastInstallOptions = options;
   // entry.currentProgress stays null: the install is complete.
 
+  recordInstalled(std::move(entry), true);
+  return true;
+}
+
+void FakeARWorkspace::recordInstalled(Entry entry, bool dropProgress) {
   std::vector<std::uint64_t> registrations;
   ARProxyList proxies;
   {
     std::lock_guard lock(mutex_);
-    std::erase_if(progress_, [&](const auto& item) { return item.first.first == *identifier; });
+    if (dropProgress) {
+      const std::string& id = entry.record.identifier;
+      std::erase_if(progress_, [&](const auto& item) { return item.first.first == id; });
+    }
     proxies.push_back(makeApplicationProxy(entry));
     putLocked(std::move(entry));
     registrations = registrationsLocked();
   }
   postEvent(std::move(registrations),
             &ARApplicationWorkspaceObserverProtocol::applicationsDidInstall, std::move(proxies));
-  return true;
 }
 
 }  // namespace appsync
