@@ -342,4 +342,12 @@ std::optional<std::uint64_t> fileSize(const std::string& path, ErrorRef* error) 
   return static_cast<std::uint64_t>(st.st_size);
 }
 
+std::FILE* openFileForAppending(const std::string& path) {
+  const int fd = ::open(path.c_str(), O_WRONLY | O_APPEND | O_CREAT | O_CLOEXEC | O_NOFOLLOW, 0644);
+  if (fd < 0) return nullptr;
+  std::FILE* file = ::fdopen(fd, "a");
+  if (file == nullptr) ::close(fd);
+  return file;
+}
+
 }  // namespace appsync

@@ -5,6 +5,7 @@
 #include <sys/types.h>
 
 #include <cstdint>
+#include <cstdio>
 #include <ctime>
 #include <optional>
 #include <span>
@@ -35,6 +36,10 @@ std::optional<FileIdentity> fileIdentity(const std::string& path);
 // of the file that was read, taken from the open file itself.
 std::optional<plist::Bytes> readFile(const std::string& path, ErrorRef* error = nullptr,
                                      FileIdentity* identity = nullptr);
+
+// Opens `path` for appending, creating it if needed; null when it cannot be opened or is a
+// symbolic link (appending through one could write anywhere). The caller closes it.
+std::FILE* openFileForAppending(const std::string& path);
 
 // Replaces `path` with `bytes` so that any reader, and any crash of this process, sees either the
 // old file or the new one: a temporary file in the same directory is written completely, then

@@ -4,6 +4,7 @@
 #include <cstdio>
 #include <ctime>
 
+#include "runtime/fs/files.h"
 #include "runtime/log/log.h"
 
 namespace appsync {
@@ -37,7 +38,7 @@ void MemoryLogSink::clear() {
   lines_.clear();
 }
 
-FileLogSink::FileLogSink(std::string path) : file_(std::fopen(path.c_str(), "ae")) {}
+FileLogSink::FileLogSink(std::string path) : file_(openFileForAppending(path)) {}
 
 FileLogSink::~FileLogSink() {
   if (file_) std::fclose(file_);

@@ -1,0 +1,170 @@
+// A device held by one command: locked, loaded, settled and saved.
+#include "device_session.h"
+
+#include <cstdio>
+#include <exception>
+#include <utility>
+
+#include "input_error.h"
+#include "platform/fake/state_fields.h"
+#include "runtime/fs/files.h"
+
+namespace appsync::host {
+
+namespace {
+
+// Writes every message both to memory (for transcripts) and to the device's log file.
+class DeviceLogSink : public LogSink {
+ public:
+  DeviceLogSink(std::shared_ptr<MemoryLogSink> memory, const std::string& path)
+      : memory_(std::move(memory)), file_(path) {}
+  void write(int category, LogLevel level, std::string_view message) override {
+    memory_->write(category, level, message);
+    file_.write(category, level, message);
+  }
+
+ private:
+  std::shared_ptr<MemoryLogSink> memory_;
+  FileLogSink file_;
+};
+
+// Releases and drains every fake that delivers on a thread of its own; true when one of them
+// still had something queued before its drain.
+bool settleOnce(FakePlatform& device) {
+  bool busy = false;
+  for (CallbackThread* thread :
+       {&device.ar().callbackThread(), &device.system().callbackThread(),
+        &device.tr().deviceService().callbackThread(), &device.bz().callbackThread()}) {
+    busy = busy || thread->pendingCount() > 0;
+    thread->release();
+    thread->drain();
+  }
+  device.kc().release();
+  device.kc().drain();
+  return busy;
+}
+
+}  // namespace
+
+std::filesystem::path DeviceSession::stateDirectory(const std::filesystem::path& root) {
+  return root / ".platform";
+}
+std::filesystem::path DeviceSession::logFile(const std::filesystem::path& root) {
+  return root / "appsync.log";
+}
+std::filesystem::path DeviceSession::transactionFile(const std::filesystem::path& root) {
+  return root / "transactions.log";
+}
+
+std::unique_ptr<DeviceSession> DeviceSession::open(const std::filesystem::path& root) {
+  const auto state = stateDirectory(root);
+  std::error_code ec;
+  // A .platform that is a link could have the device's state written anywhere.
+  if (!std::filesystem::is_directory(std::filesystem::symlink_status(state, ec))) {
+    throw InputError(root.string(), 0, "",
+                     "holds no device (no .platform directory); create one with "
+                     "`appsync-host device init --root " + root.string() + "`");
+  }
+  DeviceLock lock = DeviceLock::acquire(state);
+  FakePlatform::Options options;
+  try {
+    options = FakePlatform::loadOptions(state);
+  } catch (const StateFormatError& e) {
+    throw InputError((state / "device.plist").string(), 0, "", e.what());
+  }
+  std::unique_ptr<DeviceSession> session(new DeviceSession(root, std::move(lock), options));
+  try {
+    session->device_->loadState(state);
+  } catch (const std::exception& e) {
+    session->closed_ = true;  // nothing of a half-loaded device is written back
+    throw InputError(state.string(), 0, "", e.what());
+  }
+  session->attachLogs();
+  return session;
+}
+
+std::unique_ptr<DeviceSession> DeviceSession::create(const std::filesystem::path& root,
+                                                     const FakePlatform::Options& options) {
+  const auto state = stateDirectory(root);
+  std::error_code ec;
+  if (std::filesystem::exists(state, ec)) {
+    throw InputError(root.string(), 0, "", "already holds a device");
+  }
+  std::filesystem::create_directories(state, ec);
+  if (ec) {
+    throw InputError(root.string(), 0, "", "cannot create the device: " + ec.message());
+  }
+  DeviceLock lock = DeviceLock::acquire(state);
+  std::unique_ptr<DeviceSession> session(new DeviceSession(root, std::move(lock), options));
+  session->attachLogs();
+  return session;
+}
+
+DeviceSession::DeviceSession(std::filesystem::path root, DeviceLock lock,
+                             FakePlatform::Options options)
+    : root_(std::move(root)), lock_(std::move(lock)) {
+  options.manualClock = true;
+  device_ = std::make_unique<FakePlatform>(root_, options);
+}
+
+void DeviceSession::attachLogs() {
+  device_->tr().logger().setSink(
+      std::make_shared<DeviceLogSink>(device_->tr().logSink(), logFile(root_).string()));
+  std::shared_ptr<std::FILE> transactions(openFileForAppending(transactionFile(root_).string()),
+                                          [](std::FILE* file) {
+                                            if (file) std::fclose(file);
+                                          });
+  device_->transactionLog().setEntryListener([transactions](const TransactionLogEntry& entry) {
+    if (!transactions) return;
+    std::fprintf(transactions.get(), "%s\n", entry.describe().c_str());
+    std::fflush(transactions.get());
+  });
+}
+
+DeviceSession::~DeviceSession() {
+  if (closed_) return;
+  try {
+    close();
+  } catch (const std::exception& e) {
+    std::fprintf(stderr, "appsync-host: %s\n", e.what());
+  }
+}
+
+AppsClient& DeviceSession::client() {
+  if (!client_) client_ = std::make_unique<AppsClient>(device_->platform());
+  return *client_;
+}
+
+void DeviceSession::settle() {
+  // Each delivery may make more (an observer that calls back into a service): go round until a
+  // whole round finds nothing queued.
+  for (int round = 0; round < 1000; ++round) {
+    if (!settleOnce(*device_) && round > 0) return;
+  }
+  throw std::runtime_error("the device does not come to rest: its services keep making events");
+}
+
+void DeviceSession::close() {
+  if (closed_) return;
+  closed_ = true;
+  settle();
+  client_.reset();
+  settle();
+  device_->saveState(stateDirectory(root_));
+}
+
+DeviceSession::Produced DeviceSession::takeProduced() {
+  std::lock_guard lock(producedMutex_);
+  Produced produced;
+  const auto lines = device_->log().lines();
+  for (std::size_t i = logSeen_; i < lines.size(); ++i) produced.log.push_back(lines[i]);
+  logSeen_ = lines.size();
+  const auto entries = device_->transactionLog().entries();
+  for (std::size_t i = transactionsSeen_; i < entries.size(); ++i) {
+    produced.transactions.push_back(entries[i]);
+  }
+  transactionsSeen_ = entries.size();
+  return produced;
+}
+
+}  // namespace appsync::host

@@ -1,0 +1,75 @@
+// One command's hold on a device kept in a directory: the lock that keeps other commands out,
+// the fakes loaded from ROOT/.platform, the client the host daemon loads, and, at the end, a
+// device brought to rest and saved.
+#pragma once
+
+#include <filesystem>
+#include <memory>
+#include <mutex>
+#include <string>
+#include <vector>
+
+#include "client/apps_client.h"
+#include "device_lock.h"
+#include "platform/fake/fake_platform.h"
+#include "runtime/log/log.h"
+
+namespace appsync::host {
+
+class DeviceSession {
+ public:
+  // The device's directory of saved fake state, and its log files.
+  static std::filesystem::path stateDirectory(const std::filesystem::path& root);
+  static std::filesystem::path logFile(const std::filesystem::path& root);          // appsync.log
+  static std::filesystem::path transactionFile(const std::filesystem::path& root);  // transactions.log
+
+  // Opens the device at `root` and loads it. InputError when root holds no device or its state
+  // is malformed (naming the file and field); DeviceBusy when another command holds it.
+  static std::unique_ptr<DeviceSession> open(const std::filesystem::path& root);
+  // Makes a new device at `root` (created if missing; it must not hold a device yet).
+  static std::unique_ptr<DeviceSession> create(const std::filesystem::path& root,
+                                               const FakePlatform::Options& options);
+  // Saves and releases the device if close() was not called (errors are then only printed).
+  ~DeviceSession();
+  DeviceSession(const DeviceSession&) = delete;
+  DeviceSession& operator=(const DeviceSession&) = delete;
+
+  const std::filesystem::path& root() const { return root_; }
+  FakePlatform& device() { return *device_; }
+  const Paths& paths() const { return device_->paths(); }
+  // Always a manual clock: the simulator's time moves only when a command moves it.
+  ManualClock& clock() { return *device_->manualClock(); }
+
+  // The client, created on first use as the host daemon creates it when it loads the plugin.
+  AppsClient& client();
+  bool hasClient() const { return client_ != nullptr; }
+
+  // Lets every fake deliver what it holds (held events are released) and waits until no fake
+  // has anything left to deliver.
+  void settle();
+  // Settles, releases the client (which waits for its own work), settles again and saves the
+  // device. Throws std::runtime_error when the state cannot be written.
+  void close();
+
+  // Log lines and transaction-log entries since the last call: what one step produced.
+  struct Produced {
+    std::vector<MemoryLogSink::Line> log;
+    std::vector<TransactionLogEntry> transactions;
+  };
+  Produced takeProduced();
+
+ private:
+  DeviceSession(std::filesystem::path root, DeviceLock lock, FakePlatform::Options options);
+  void attachLogs();
+
+  std::filesystem::path root_;
+  DeviceLock lock_;
+  std::unique_ptr<FakePlatform> device_;
+  std::unique_ptr<AppsClient> client_;
+  bool closed_ = false;
+  std::mutex producedMutex_;
+  std::size_t logSeen_ = 0;
+  std::size_t transactionsSeen_ = 0;
+};
+
+}  // namespace appsync::host
