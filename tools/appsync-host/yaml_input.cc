@@ -24,8 +24,6 @@ std::string joinKeys(const std::vector<std::string>& keys) {
   return out;
 }
 
-bool isPlain(const YAML::Node& node) { return node.Tag() == "?"; }
-
 std::optional<std::uint64_t> parseUnsigned(const std::string& text) {
   if (text.empty() || text[0] == '-' || text[0] == '+' || text.find(' ') != std::string::npos) {
     return std::nullopt;
@@ -161,7 +159,7 @@ std::string YamlField::scalar(std::string_view expected) const {
 
 std::string YamlField::string() const {
   std::string text = scalar("a text");
-  if (!plist::isValidUtf8(text)) fail("the text is not valid UTF-8");
+  if (!plist::text::isValidUtf8(text)) fail("the text is not valid UTF-8");
   return text;
 }
 
@@ -252,12 +250,12 @@ struct PlistBuilder {
     if (tag == "!real") return field.real();
     if (tag == "!bool") return field.boolean();
     if (tag == "!data") {
-      auto bytes = plist::base64Decode(text);
+      auto bytes = plist::text::base64Decode(text);
       if (!bytes) field.fail("expected base64 data");
       return *bytes;
     }
     if (tag == "!date") {
-      auto seconds = plist::parseIsoDate(text);
+      auto seconds = plist::text::parseIsoDate(text);
       if (!seconds) field.fail("expected a date such as 2026-11-23T10:00:00Z");
       return plist::Date{*seconds};
     }

@@ -39,6 +39,14 @@ class FakePlatform {
   FakePlatform(const FakePlatform&) = delete;
   FakePlatform& operator=(const FakePlatform&) = delete;
 
+  // The device's saved state: one property list per service in `directory` (the simulator's
+  // ROOT/.platform), XML. Saving twice with no change writes identical bytes. Throw
+  // StateFormatError ("FILE: field: problem") or std::runtime_error naming the file.
+  void saveState(const std::filesystem::path& directory) const;
+  void loadState(const std::filesystem::path& directory);
+  // The options a device was created with, saved in `directory`/device.plist by saveState.
+  static Options loadOptions(const std::filesystem::path& directory);
+
   const Platform& platform() const { return platform_; }
   const Paths& paths() const { return paths_; }
   Clock& clock() { return *clock_; }
