@@ -1,0 +1,294 @@
+// Devices made from descriptions: each application recorded as a real install records it, the
+// device-wide facts where the plugin reads them, bad descriptions refused where they are wrong,
+// and `device init` as a command.
+#include "device_description.h"
+
+#include <gtest/gtest.h>
+#include <zip.h>
+
+#include <cstdlib>
+#include <filesystem>
+#include <map>
+#include <string>
+
+#include "bundle_maker.h"
+#include "device_files.h"
+#include "platform/ar.h"
+#include "platform/bundle_keys.h"
+#include "platform/fake/fake_ar_bundle_files.h"
+#include "platform/icon/home_screen_icon_service.h"
+#include "platform/rs.h"
+#include "runtime/fs/files.h"
+#include "runtime/plist/codec.h"
+#include "support/host_process.h"
+#include "support/temp_dir.h"
+#include "support/text_file.h"
+
+namespace appsync::host {
+namespace {
+
+namespace fs = std::filesystem;
+using AppRecord = FakeARWorkspace::AppRecord;
+
+constexpr std::string_view kDescription = R"(road: coordination
+insideHostDaemon: true
+apps:
+  - identifier: com.a.notes
+    name: Notes
+    version: 1.0
+    installType: storeDownload
+    hasMIDBasedSINF: true
+    restoreData: 4096
+    storeMetadata: {vantorId: a@example.com, is-auto-download: true}
+  - identifier: com.a.clock
+    name: Clock
+    type: system
+    diskUsage: 777
+  - identifier: com.a.later
+    placeholder: true
+    installType: 2
+  - identifier: com.a.settings
+    type: system
+    placeholder: true
+restrictions: {allowAppRemoval: false}
+iconOrder: [com.a.clock, com.a.gone]
+demotedApps: {AutomaticDowngrades: [com.a.later]}
+lastSync: [com.a.notes, com.a.old]
+uninstalled: [com.a.old]
+)";
+
+std::optional<plist::Value> readPlist(const fs::path& path) {
+  auto bytes = readFile(path.string());
+  return bytes ? plist::parse(*bytes) : std::nullopt;
+}
+
+// The record with its paths made relative to `root`, and without the options of the install
+// that made it (a described application had none).
+AppRecord relative(AppRecord record, const fs::path& root) {
+  for (auto* path : {&record.bundleDirectory, &record.containerDirectory, &record.iconPath}) {
+    if (*path) *path = fs::path(**path).lexically_relative(root).generic_string();
+  }
+  record.lastInstallOptions = {};
+  return record;
+}
+
+std::string show(const AppRecord& r) {
+  return r.identifier + " " + r.applicationType + " v" + r.version.value_or("-") + " name " +
+         r.name.value_or("-") + " type " + std::to_string(r.installType) +
+         (r.isPlaceholder ? " placeholder" : " installed") + " bundle " +
+         r.bundleDirectory.value_or("-") + " container " + r.containerDirectory.value_or("-") +
+         " icon " + r.iconPath.value_or("-") + " disk " +
+         (r.staticDiskUsage ? std::to_string(*r.staticDiskUsage) : "-") +
+         (r.hasMIDBasedSINF ? " sinf" : "");
+}
+
+class DeviceDescriptionTest : public ::testing::Test {
+ protected:
+  std::unique_ptr<DeviceSession> make(const YamlField* description) {
+    auto session = DeviceSession::create(root.path(), deviceOptions(description));
+    applyDescription(*session, description);
+    return session;
+  }
+  testing::TempDir root;
+};
+
+TEST_F(DeviceDescriptionTest, AppsAreRecordedAsTheRegistryRecordsTheirInstalls) {
+  const YamlField description = YamlField::loadText(kDescription, "d.yaml");
+  auto session = make(&description);
+  FakeARWorkspace& registry = session->device().ar();
+
+  // The same Notes installed as a package on another device: the described one must not differ.
+  testing::TempDir other;
+  FakeARWorkspace installer(other.path());
+  const fs::path package =
+      makeBundle(other.path(), other.path() / "in",
+                 {.identifier = "com.a.notes", .name = "Notes", .version = "1.0"});
+  plist::Dict options;
+  options.set(std::string(kBNBundleIdentifierKey), "com.a.notes");
+  options.set(std::string(ARInstallTypeKey), plist::Integer::fromUnsigned(1));
+  ASSERT_TRUE(installer.installApplication(package.string(), options, nullptr));
+  AppRecord installedNotes = relative(*installer.application("com.a.notes"), other.path());
+  installedNotes.hasMIDBasedSINF = true;
+
+  const std::string bundles = "private/var/containers/Bundle/Application/";
+  const std::map<std::string, std::string> expected = {
+      {"com.a.notes", show(installedNotes)},
+      {"com.a.clock", "com.a.clock System v1.0 name Clock type 0 installed bundle " + bundles +
+                          "com.a.clock/Clock.app container " + bundles + "com.a.clock icon " +
+                          bundles + "com.a.clock/Clock.app/Icon.png disk 777"},
+      {"com.a.later", "com.a.later User v1.0 name later type 2 placeholder bundle " + bundles +
+                          "com.a.later/later.app container - icon " + bundles +
+                          "com.a.later/later.app/Icon.png disk -"},
+      {"com.a.settings", "com.a.settings System v1.0 name settings type 0 placeholder bundle " +
+                             bundles + "com.a.settings/settings.app container - icon " + bundles +
+                             "com.a.settings/settings.app/Icon.png disk -"},
+  };
+  ASSERT_EQ(registry.applications().size(), expected.size());
+  for (const auto& [identifier, record] : expected) {
+    const auto found = registry.application(identifier);
+    ASSERT_TRUE(found) << identifier;
+    EXPECT_EQ(show(relative(*found, root.path())), record);
+  }
+  // Placeholders are what the registry answers only when asked for placeholders.
+  EXPECT_FALSE(registry.applicationProxyForIdentifier("com.a.later", false));
+  EXPECT_TRUE(registry.applicationProxyForIdentifier("com.a.later", true));
+
+  // The store metadata beside the bundle, where the plugin looks for it.
+  const auto metadata = readPlist(root.path() / bundles / "com.a.notes" / "CaravelMetadata.plist");
+  ASSERT_TRUE(metadata && metadata->dict());
+  EXPECT_EQ(*plist::stringAt(*metadata->dict(), "vantorId"), "a@example.com");
+  EXPECT_FALSE(fs::exists(root.path() / bundles / "com.a.clock" / "CaravelMetadata.plist"));
+}
+
+TEST_F(DeviceDescriptionTest, DeviceWideFactsGoWhereThePluginReadsThem) {
+  const YamlField description = YamlField::loadText(kDescription, "d.yaml");
+  const FakePlatform::Options options = deviceOptions(&description);
+  EXPECT_TRUE(options.coordination);
+  EXPECT_EQ(options.mainBundleIdentifier, "com.vantor.trc");
+  auto session = make(&description);
+  FakePlatform& device = session->device();
+
+  EXPECT_EQ(device.system().mainBundleIdentifier(), "com.vantor.trc");
+  EXPECT_EQ(device.rs().effectiveBoolValueForSetting(RSFeatureAppRemovalAllowed),
+            RSRestrictedBoolExplicitNo);
+  EXPECT_EQ(device.rs().effectiveBoolValueForSetting(RSFeatureAppInstallationAllowed),
+            RSRestrictedBoolNoData);
+  std::uint64_t size = 0;
+  EXPECT_TRUE(
+      device.sw().newManager()->restoreDataExistsForApplicationWithBundleID("com.a.notes", &size));
+  EXPECT_EQ(size, 4096u);
+  EXPECT_FALSE(
+      device.sw().newManager()->restoreDataExistsForApplicationWithBundleID("com.a.clock", &size));
+  PVBuffer buffer;
+  std::uint32_t length = 0;
+  device.pv().PVGetFlattenedIconState(device.pv().PVSPavilionBlockableServerPort(), 0, &buffer,
+                                      &length);
+  ASSERT_TRUE(buffer);
+  EXPECT_EQ(plist::parse(plist::Bytes(buffer.get(), buffer.get() + length)),
+            plist::Value(plist::Array{"com.a.clock", "com.a.gone"}));
+  plist::Dict demoted;
+  demoted.set("AutomaticDowngrades", plist::Array{"com.a.later"});
+  EXPECT_EQ(readPlist(session->paths().demotedApps()), plist::Value(demoted));
+  EXPECT_EQ(readPlist(session->paths().lastSyncAppState()),
+            plist::Value(plist::Array{"com.a.notes", "com.a.old"}));
+  EXPECT_EQ(device.em().uninstalled(), std::vector<std::string>{"com.a.old"});
+}
+
+TEST_F(DeviceDescriptionTest, TheDefaultDeviceHasUserAndSystemAppsWithIcons) {
+  const FakePlatform::Options options = deviceOptions(nullptr);
+  EXPECT_FALSE(options.coordination);
+  EXPECT_NE(options.mainBundleIdentifier, "com.vantor.trc");
+  auto session = make(nullptr);
+  std::map<std::string, int> types;
+  for (const AppRecord& app : session->device().ar().applications()) {
+    ++types[app.applicationType + (app.isPlaceholder ? " placeholder" : "")];
+    std::string why;
+    EXPECT_TRUE(renderIconPng(*app.bundleDirectory, 57, &why)) << app.identifier << ": " << why;
+  }
+  EXPECT_EQ(types, (std::map<std::string, int>{{"User", 2}, {"System", 1}}));
+}
+
+TEST(DeviceDescriptionErrorsTest, BadDescriptionsNameTheLineAndTheField) {
+  struct Row {
+    std::string document;
+    std::string error;
+  };
+  const Row rows[] = {
+      {"road: legacy\nhomeScreen: []\n", "d.yaml:2: homeScreen: unknown field \"homeScreen\""},
+      {"road: highway\n", "d.yaml:1: road: expected coordination or legacy"},
+      {"insideHostDaemon: 1\n", "d.yaml:1: insideHostDaemon: expected true or false"},
+      {"apps: com.a\n", "d.yaml:1: apps: expected a list"},
+      {"apps:\n  - com.a\n", "d.yaml:2: apps[0]: expected a mapping"},
+      {"apps:\n  - name: A\n", "d.yaml:2: apps[0]: the field \"identifier\" is missing"},
+      {"apps:\n  - identifier: com.a\n    verison: 2\n",
+       "d.yaml:3: apps[0].verison: unknown field \"verison\""},
+      {"apps:\n  - identifier: com.a\n  - identifier: com.b\n  - identifier: com.a\n",
+       "d.yaml:4: apps[2].identifier: \"com.a\" is described twice"},
+      {"apps:\n  - identifier: ../../etc\n", "d.yaml:2: apps[0].identifier: \"../../etc\" cannot"},
+      {"apps:\n  - identifier: ..\n", "d.yaml:2: apps[0].identifier: \"..\" cannot"},
+      {"apps:\n  - identifier: com.a\n    name: ../A\n", "d.yaml:3: apps[0].name: \"../A\" cannot"},
+      {"apps:\n  - identifier: com.a\n    type: admin\n",
+       "d.yaml:3: apps[0].type: expected user or system"},
+      {"apps:\n  - identifier: com.a\n    placeholder: maybe\n",
+       "d.yaml:3: apps[0].placeholder: expected true or false"},
+      {"apps:\n  - identifier: com.a\n    diskUsage: -5\n",
+       "d.yaml:3: apps[0].diskUsage: expected an unsigned integer"},
+      {"apps:\n  - identifier: com.a\n    installType: bought\n",
+       "d.yaml:3: apps[0].installType: expected a number or one of"},
+      {"apps:\n  - identifier: com.a\n    storeMetadata: ~\n",
+       "d.yaml:3: apps[0].storeMetadata: a property list has no null"},
+      {"restrictions: {allowEverything: true}\n",
+       "d.yaml:1: restrictions.allowEverything: unknown field"},
+      {"restrictions: {allowAppRemoval: no}\n",
+       "d.yaml:1: restrictions.allowAppRemoval: expected true or false"},
+      {"iconOrder: {a: 1}\n", "d.yaml:1: iconOrder: expected a list"},
+      {"lastSync: [a, ~]\n", "d.yaml:1: lastSync[1]: a property list has no null"},
+      {"- road: legacy\n", "d.yaml:1: a device description is a mapping"},
+  };
+  for (const Row& row : rows) {
+    std::string error;
+    try {
+      const YamlField description = YamlField::loadText(row.document, "d.yaml");
+      // Reading the options reads everything: bad input is found before a device exists.
+      deviceOptions(&description);
+    } catch (const InputError& e) {
+      error = e.what();
+    }
+    EXPECT_EQ(error.rfind(row.error, 0), 0u) << row.document << "\n  error: " << error;
+  }
+}
+
+TEST(BundleMakerTest, BundlesRenderPackAndStayUnderTheRoot) {
+  testing::TempDir root;
+  const BundleSpec spec{.identifier = "com.a.notes", .name = "Notes", .version = "3"};
+  const fs::path bundle = makeBundle(root.path(), root.path() / "b", spec);
+  EXPECT_EQ(bundle, root.path() / "b" / "Notes.app");
+  std::string why;
+  const auto info = fake_ar::readInfoPlist(bundle.string(), &why);
+  ASSERT_TRUE(info) << why;
+  EXPECT_EQ(*plist::stringAt(*info, kBNBundleIdentifierKey), "com.a.notes");
+  EXPECT_EQ(*plist::stringAt(*info, kBNBundleVersionKey), "3");
+  EXPECT_EQ(*plist::stringAt(*info, _kBNBundleDisplayNameKey), "Notes");
+  EXPECT_TRUE(renderIconPng(bundle.string(), 57, &why)) << why;
+
+  // Packed: the folder at the top of the archive, every file as it is.
+  makeDeviceDirectory(root.path(), bundle / "Sub");
+  testing::writeText(bundle / "Sub" / "data.txt", "payload");
+  const fs::path zipPath = root.path() / "staging" / "Notes.zip";
+  zipBundle(root.path(), bundle, zipPath);
+  int status = 0;
+  zip_t* archive = zip_open(zipPath.c_str(), ZIP_RDONLY, &status);
+  ASSERT_TRUE(archive) << status;
+  std::map<std::string, std::string> entries;
+  for (zip_int64_t i = 0; i < zip_get_num_entries(archive, 0); ++i) {
+    zip_stat_t stat;
+    zip_stat_index(archive, i, 0, &stat);
+    std::string bytes(stat.size, '\0');
+    zip_file_t* file = zip_fopen_index(archive, i, 0);
+    ASSERT_TRUE(file);
+    EXPECT_EQ(zip_fread(file, bytes.data(), bytes.size()), static_cast<zip_int64_t>(stat.size));
+    zip_fclose(file);
+    entries[stat.name] = bytes;
+  }
+  zip_close(archive);
+  EXPECT_EQ(entries.size(), 5u);  // Notes.app/, Info.plist, Icon.png, Sub/, Sub/data.txt
+  EXPECT_EQ(entries["Notes.app/Sub/data.txt"], "payload");
+  EXPECT_EQ(entries["Notes.app/Icon.png"], testing::readText(bundle / "Icon.png"));
+  EXPECT_EQ(entries["Notes.app/Info.plist"], testing::readText(bundle / "Info.plist"));
+
+  // Nothing outside the root, and no link packed or written through.
+  testing::TempDir outside;
+  EXPECT_THROW(makeBundle(root.path(), root.path() / ".." / "x", spec), std::runtime_error);
+  EXPECT_THROW(makeBundle(root.path(), root.path() / "b",
+                          {.identifier = "x", .name = "../x", .version = "1"}),
+               std::runtime_error);
+  fs::create_directory_symlink(outside.path(), root.path() / "link");
+  EXPECT_THROW(makeBundle(root.path(), root.path() / "link", spec), std::runtime_error);
+  EXPECT_TRUE(fs::is_empty(outside.path()));
+  fs::create_symlink(outside.path(), bundle / "escape");
+  EXPECT_THROW(zipBundle(root.path(), bundle, root.path() / "Again.zip"), std::runtime_error);
+  EXPECT_FALSE(fs::exists(root.path() / "Again.zip"));
+}
+
+}  // namespace
+}  // namespace appsync::host
