@@ -6,6 +6,7 @@
 #include <gtest/gtest.h>
 #include <zip.h>
 
+#include <algorithm>
 #include <cstdlib>
 #include <filesystem>
 #include <map>
@@ -288,6 +289,76 @@ TEST(BundleMakerTest, BundlesRenderPackAndStayUnderTheRoot) {
   fs::create_symlink(outside.path(), bundle / "escape");
   EXPECT_THROW(zipBundle(root.path(), bundle, root.path() / "Again.zip"), std::runtime_error);
   EXPECT_FALSE(fs::exists(root.path() / "Again.zip"));
+}
+
+// The records of a device, paths relative to its root, one line each in the registry's order.
+std::vector<std::string> recordsOf(DeviceSession& session) {
+  std::vector<std::string> out;
+  for (const AppRecord& app : session.device().ar().applications()) {
+    out.push_back(show(relative(app, session.root())));
+  }
+  return out;
+}
+
+TEST(DeviceInitCommandTest, MakesSavesAndRefusesDevices) {
+  const char* host = std::getenv("APPSYNC_HOST");
+  const char* source = std::getenv("APPSYNC_SOURCE_DIR");
+  ASSERT_TRUE(host && source) << "APPSYNC_HOST and APPSYNC_SOURCE_DIR are set by the build";
+  const fs::path examples = fs::path(source) / "tests" / "scenarios" / "devices";
+  testing::TempDir dir;
+  const auto init = [&](const std::string& root, const std::string& from) {
+    return testing::runHost(host,
+                            "device init --root '" + (dir / root) + "'" +
+                                (from.empty() ? "" : " --from '" + from + "'"),
+                            dir.path());
+  };
+
+  // Each example as a command makes it: one line per app and a summary, and a later command
+  // loads the same records the description gives.
+  for (const std::string name : {"default.yaml", "coordinated-daemon.yaml", "legacy-road.yaml"}) {
+    const testing::HostRun made = init(name, (examples / name).string());
+    ASSERT_EQ(made.status, 0) << name << ": " << made.stderrText;
+    const YamlField description = YamlField::loadFile((examples / name).string());
+    testing::TempDir direct;
+    auto expected = DeviceSession::create(direct.path(), deviceOptions(&description));
+    applyDescription(*expected, &description);
+    const auto loaded = DeviceSession::open(dir / name);
+    EXPECT_EQ(recordsOf(*loaded), recordsOf(*expected)) << name;
+    EXPECT_EQ(std::count(made.stdoutText.begin(), made.stdoutText.end(), '\n'),
+              static_cast<long>(recordsOf(*expected).size()) + 1)
+        << made.stdoutText;
+  }
+  // Without a description: the default device, as default.yaml writes it out.
+  ASSERT_EQ(init("plain", "").status, 0);
+  {
+    const auto plain = DeviceSession::open(dir / "plain");
+    const auto fromFile = DeviceSession::open(dir / "default.yaml");
+    EXPECT_EQ(recordsOf(*plain).size(), 3u);
+    for (std::size_t i = 0; i < recordsOf(*plain).size(); ++i) {
+      // Same records but for the root they live under.
+      EXPECT_EQ(recordsOf(*plain)[i], recordsOf(*fromFile)[i]);
+    }
+  }
+
+  // A described app's icon renders from its bundle on the device.
+  const testing::HostRun icon = testing::runHost(
+      host,
+      "icon '" +
+          (dir / "plain/private/var/containers/Bundle/Application/com.example.notes/Notes.app") +
+          "' -o '" + (dir / "notes.png") + "'",
+      dir.path());
+  EXPECT_EQ(icon.status, 0) << icon.stderrText;
+
+  // A root that holds a device is refused and left alone; bad input makes no device.
+  const testing::HostRun again = init("plain", "");
+  EXPECT_EQ(again.status, 2);
+  EXPECT_NE(again.stderrText.find("already holds a device"), std::string::npos) << again.stderrText;
+  testing::writeText(dir.path() / "bad.yaml", "apps:\n  - identifier: com.a\n    tpye: system\n");
+  const testing::HostRun bad = init("badroot", dir / "bad.yaml");
+  EXPECT_EQ(bad.status, 2);
+  EXPECT_NE(bad.stderrText.find("bad.yaml:3: apps[0].tpye: unknown field"), std::string::npos)
+      << bad.stderrText;
+  EXPECT_FALSE(fs::exists(dir.path() / "badroot"));
 }
 
 }  // namespace

@@ -32,10 +32,10 @@ void printDevice(DeviceSession& session, const FakePlatform::Options& options) {
                 app.applicationType.c_str(), app.isPlaceholder ? "placeholder" : "installed",
                 relativeTo(session.root(), app.bundleDirectory).c_str());
   }
-  std::printf("device at %s: %s road, %s the host daemon, %zu apps (%zu placeholders)\n",
+  std::printf("device at %s: %s road, %s the host daemon, %zu app%s (%zu placeholder%s)\n",
               session.root().string().c_str(), options.coordination ? "coordination" : "legacy",
               options.mainBundleIdentifier == "com.vantor.trc" ? "inside" : "outside", apps.size(),
-              placeholders);
+              apps.size() == 1 ? "" : "s", placeholders, placeholders == 1 ? "" : "s");
 }
 
 int initDevice(const fs::path& root, const std::string& from) {
