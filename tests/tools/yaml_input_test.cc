@@ -4,18 +4,16 @@
 
 #include <gtest/gtest.h>
 
+#include <chrono>
 #include <filesystem>
 #include <functional>
 #include <string>
-#include <vector>
 
 #include "support/temp_dir.h"
 #include "support/text_file.h"
 
 namespace appsync::host {
 namespace {
-
-using namespace std::chrono_literals;
 
 // What a reader made of a value ("" when it failed) and the error it gave ("" when none).
 struct Outcome {
@@ -51,26 +49,15 @@ TEST(YamlInputTest, ScalarReadersTakeWhatTheyPromiseAndNameTheFieldOtherwise) {
     Outcome expected;
   };
   const Row rows[] = {
-      {"v: -9223372036854775808", integer, {"-9223372036854775808", ""}},
       {"v: 9223372036854775808", integer, {"", "in.yaml:1: v: expected an integer"}},
       {"v: 0x1F", integer, {"31", ""}},
-      {"v: 1.5", integer, {"", "in.yaml:1: v: expected an integer, found \"1.5\""}},
-      {"v: 18446744073709551615", natural, {"18446744073709551615", ""}},
       {"v: 18446744073709551616", natural, {"", "in.yaml:1: v: expected an unsigned integer"}},
       {"v: -1", natural, {"", "in.yaml:1: v: expected an unsigned integer"}},
-      {"v: +1", natural, {"", "in.yaml:1: v: expected an unsigned integer"}},
-      {"v: 2.5", real, {"2.500000", ""}},
       {"v: 1e400", real, {"", "in.yaml:1: v: expected a number"}},
-      {"v: nan", real, {"", "in.yaml:1: v: expected a number"}},
-      {"v: true", boolean, {"yes", ""}},
       {"v: yes", boolean, {"", "in.yaml:1: v: expected true or false, found \"yes\""}},
       {"v: 1500ms", duration, {"1500", ""}},
-      {"v: 2m", duration, {"120000", ""}},
-      {"v: 1.5h", duration, {"5400000", ""}},
-      {"v: 7", duration, {"7000", ""}},
       {"v: -1s", duration, {"", "in.yaml:1: v: the duration must be between"}},
       {"v: 3 days", duration, {"", "in.yaml:1: v: expected a duration such as 30s"}},
-      {"v: [a]", text, {"", "in.yaml:1: v: expected a text"}},
       {"v: a\xff", text, {"", "in.yaml:1: v: the text is not valid UTF-8"}},
       {"a:\n  - b: 1\n  - b: -4\n", nested, {"", "in.yaml:3: a[1].b: expected an unsigned"}},
       {"a:\n  - b: 1\n  - c: 4\n", nested, {"", "in.yaml:3: a[1]: the field \"b\" is missing"}},
@@ -100,21 +87,12 @@ TEST(YamlInputTest, PropertyListsHaveTheTypesPeopleMean) {
       {"v: 1.0", plist::Value("1.0")},
       {"v: !real 1.0", plist::Value(1.0)},
       {"v: \"12\"", plist::Value("12")},
-      {"v: 12", plist::Value(plist::Integer::fromSigned(12))},
-      {"v: 18446744073709551615", plist::Value(plist::Integer::fromUnsigned(UINT64_MAX))},
-      {"v: !uint 7", plist::Value(plist::Integer::fromUnsigned(7))},
-      {"v: !int x", std::nullopt, "in.yaml:1: v: expected an integer"},
-      {"v: false", plist::Value(false)},
-      {"v: \"true\"", plist::Value("true")},
       {"v: !data AAEC", plist::Value(plist::Bytes{0, 1, 2})},
       {"v: !data '%%'", std::nullopt, "in.yaml:1: v: expected base64 data"},
-      {"v: !date 2001-01-01T00:01:00Z", plist::Value(plist::Date{60})},
       {"v: {b: 1, a: x}", plist::Value(both)},
-      {"v: [1, [x]]", plist::Value(plist::Array{plist::Integer::fromSigned(1), plist::Array{"x"}})},
       {"v:\n  - a\n  - ~\n", std::nullopt, "in.yaml:3: v[1]: a property list has no null"},
       {"v: {a: 1, a: 2}", std::nullopt, "in.yaml:1: v.a: the key \"a\" appears twice"},
       {"v: {k\xff: 1}", std::nullopt, "in.yaml:1: v: the key is not valid UTF-8"},
-      {"v: !float 1", std::nullopt, "in.yaml:1: v: unknown tag !float"},
       {"v: &x [*x]", std::nullopt, ""},
   };
   for (const Row& row : rows) {
