@@ -12,13 +12,17 @@ void setIfPresent(plist::Dict& dict, std::string key, const std::optional<std::s
   if (value) dict.set(std::move(key), *value);
 }
 
-plist::Dict progressState(const ARInstallProgress& progress) {
-  return {{"application", progress.identifier()},
-          {"installPhase", progress.installPhase()},
-          {"installState", progress.installState()},
-          {"totalUnitCount", plist::Integer::fromSigned(progress.totalUnitCount())},
-          {"completedUnitCount", plist::Integer::fromSigned(progress.completedUnitCount())},
-          {"cancelled", progress.isCancelled()}};
+// `forPhase`: the phase the registry keeps it under, for the objects it hands out.
+plist::Dict progressState(const ARInstallProgress& progress,
+                          std::optional<std::uint64_t> forPhase = std::nullopt) {
+  plist::Dict state{{"application", progress.identifier()}};
+  if (forPhase) state.set("forPhase", *forPhase);
+  state.set("installPhase", progress.installPhase());
+  state.set("installState", progress.installState());
+  state.set("totalUnitCount", plist::Integer::fromSigned(progress.totalUnitCount()));
+  state.set("completedUnitCount", plist::Integer::fromSigned(progress.completedUnitCount()));
+  state.set("cancelled", progress.isCancelled());
+  return state;
 }
 
 std::shared_ptr<ARInstallProgress> loadProgress(const StateFields& fields) {
@@ -84,9 +88,7 @@ plist::Dict FakeARWorkspace::saveState() const {
   }
   plist::Array progress;
   for (const auto& [key, object] : progress_) {
-    plist::Dict state = progressState(*object);
-    state.set("forPhase", key.second);
-    progress.push_back(std::move(state));
+    progress.push_back(progressState(*object, key.second));
   }
   plist::Array finished;
   for (const auto& object : finishedPhases_) finished.push_back(progressState(*object));

@@ -135,8 +135,8 @@ struct Process {
 // A coordinator of `id` with a configured placeholder and no icon: the service installs the
 // placeholder at once.
 Coordinator withPlaceholder(FakeKCInstallCoordination& kc, const std::string& id) {
-  Coordinator c = kc.coordinatorForAppWithBundleID(KCCoordinatorKind::Initiating, id, kSyncClient, true,
-                                                   nullptr, nullptr);
+  Coordinator c = kc.coordinatorForAppWithBundleID(KCCoordinatorKind::Initiating, id, kSyncClient,
+                                                   true, nullptr, nullptr);
   auto placeholder = kc.initAppPlaceholder(id + " name", id, ARInstallTypeSync, kSyncClient);
   placeholder->setConfigurationCompleteWithError(nullptr);
   c->setPlaceholderPromise(placeholder, nullptr);
@@ -218,8 +218,8 @@ TEST(FakeKCStateTest, ALaterProcessCarriesOnWithALoadedCoordinator) {
   withPlaceholder(first.kc, "com.other");
   first.handOver(second);
 
-  Coordinator loaded = second.kc.coordinatorForAppWithBundleID(KCCoordinatorKind::Any, "com.game",
-                                                               kSyncClient, false, nullptr, nullptr);
+  Coordinator loaded = second.kc.coordinatorForAppWithBundleID(
+      KCCoordinatorKind::Any, "com.game", kSyncClient, false, nullptr, nullptr);
   ASSERT_TRUE(loaded);
   loaded->setObserver(&recorder);
   auto loadedAsset = loaded->appAssetPromiseWithError(nullptr);
