@@ -40,82 +40,9 @@ std::string makeBundle(const testing::TempDir& dir, const std::string& name, con
   return bundle;
 }
 
-std::string proxyFields(const std::shared_ptr<const ARApplicationProxy>& p) {
-  if (!p) return "none";
-  std::string text =
-      p->describe() + " " + p->bundleURL.value_or("-") + " " + p->bundleContainerURL.value_or("-") +
-      " " + p->bundleVersion.value_or("-") + " " + p->localizedName.value_or("-") + " " +
-      std::to_string(p->diskUsage.staticUsage.value_or(0)) + (p->hasMIDBasedSINF ? " sinf" : "");
-  return text + " " + (p->installProgressSync ? p->installProgressSync->describe() : "-");
-}
-
-struct ARCase {
-  const char* name;
-  std::function<void(FakeARWorkspace&, const testing::TempDir&)> build;
-};
-
-TEST(FakeARStateTest, ALoadedRegistryIsTheOneSaved) {
-  const ARCase cases[] = {
-      {"empty", [](FakeARWorkspace&, const testing::TempDir&) {}},
-      {"installs, progress and history",
-       [](FakeARWorkspace& ar, const testing::TempDir& dir) {
-         ErrorRef error;
-         ASSERT_TRUE(ar.installApplication(makeBundle(dir, "Game", "com.game", "2.0"),
-                                           {{"PackageType", "Customer"},
-                                            {"BNBundleIdentifier", "com.game"},
-                                            {"ARInstallType", 4}},
-                                           &error));
-         // A placeholder's options may hold the null object (no SINF).
-         ASSERT_TRUE(ar.installApplication(
-             makeBundle(dir, "Notes", "com.notes", "1.1"),
-             {{"PackageType", "Placeholder"}, {"ApplicationSINF", plist::Value::null()}}));
-         auto loading = ar.installProgress("com.notes", ARInstallPhaseLoading);
-         loading->setTotalUnitCount(-1);
-         loading->setCompletedUnitCount(40);
-         loading->cancel();
-         ar.installPhaseFinishedForProgress(loading);
-         ar.installProgress("com.notes", ARInstallPhaseInstalling)->setInstallState(2);
-         ar.uninstallApplication("com.gone", plist::Dict{{"UninstallPlaceholdersOnly", true}});
-         ar.setInstallsInProgress({"com.notes"}, {"com.game", "com.unknown"});
-       }},
-      {"records put by a test",
-       [](FakeARWorkspace& ar, const testing::TempDir&) {
-         ar.putApplication({.identifier = "com.sys",
-                            .applicationType = "System",
-                            .staticDiskUsage = 9000,
-                            .hasMIDBasedSINF = true});
-         ar.putApplication({.identifier = "com.plugin", .isApplication = false});
-         ar.putApplication({.identifier = "com.a", .version = "3", .iconPath = "/i.png"});
-       }},
-  };
-  for (const ARCase& c : cases) {
-    SCOPED_TRACE(c.name);
-    testing::TempDir dir;
-    FakeARWorkspace saved(dir.path()), loaded(dir.path());
-    c.build(saved, dir);
-    const plist::Dict state = saved.saveState();
-    loaded.loadState(throughXml(state));
-    EXPECT_EQ(loaded.saveState(), state);
-    EXPECT_TRUE(loaded.applications() == saved.applications());
-    EXPECT_TRUE(loaded.installCalls() == saved.installCalls());
-    EXPECT_TRUE(loaded.uninstallCalls() == saved.uninstallCalls());
-    for (const auto& record : saved.applications()) {
-      EXPECT_EQ(proxyFields(loaded.applicationProxyForIdentifier(record.identifier, true)),
-                proxyFields(saved.applicationProxyForIdentifier(record.identifier, true)));
-    }
-  }
-}
-
-TEST(FakeARStateTest, ALoadedProgressIsTheOneTheRegistryHandsOut) {
-  testing::TempDir dir;
-  FakeARWorkspace saved(dir.path()), loaded(dir.path());
-  saved.putApplication({.identifier = "com.a"});
-  saved.installProgress("com.a", ARInstallPhaseInstalling)->setCompletedUnitCount(7);
-  loaded.loadState(throughXml(saved.saveState()));
-  auto proxy = loaded.applicationProxyForIdentifier("com.a", false);
-  auto progress = loaded.installProgressForApplication(*proxy, ARInstallPhaseInstalling);
-  EXPECT_EQ(proxy->installProgressSync, progress);
-  EXPECT_EQ(progress->completedUnitCount(), 7);
+std::string proxyText(const std::shared_ptr<const ARApplicationProxy>& p) {
+  return p->describe() + p->bundleURL.value_or("") + p->bundleVersion.value_or("") +
+         (p->installProgressSync ? p->installProgressSync->describe() : "");
 }
 
 // The registry and coordination of one process over a device directory.
@@ -143,7 +70,8 @@ Coordinator withPlaceholder(FakeKCInstallCoordination& kc, const std::string& id
   return c;
 }
 
-// com.game with every promise kind (the user data shared with the SPR list), its icon to come.
+// com.game with every promise kind (the user data shared with the SPR list), its icon to come;
+// com.docs with its placeholder installed; another client's coordinator; coordination off.
 void everyPromiseKind(Process& p, const testing::TempDir& dir) {
   FakeKCInstallCoordination& kc = p.kc;
   Coordinator c = kc.coordinatorForAppWithBundleID(KCCoordinatorKind::Restoring, "com.game",
@@ -173,18 +101,37 @@ void everyPromiseKind(Process& p, const testing::TempDir& dir) {
   options->setCaravelMetadata(std::make_shared<EMStoreMetadata>(plist::Dict{{"k", 1}}));
   c->setInstallOptions(options, nullptr);
   c->setAppAssetPromiseResponsibleClient(KCClientBazaar, nullptr);
+  withPlaceholder(kc, "com.docs");
+  kc.putCoordinator(KCCoordinatorKind::RestoringDemoted, "com.other", 9);
+  kc.setCoordinationEnabled(false);
 }
 
-TEST(FakeKCStateTest, ALoadedServiceIsTheOneSaved) {
+TEST(FakeStateTest, ALaterProcessLoadsTheDeviceItLeft) {
   const std::pair<const char*, std::function<void(Process&, const testing::TempDir&)>> cases[] = {
-      {"nothing", [](Process&, const testing::TempDir&) {}},
-      {"every promise kind, the icon still to come", everyPromiseKind},
-      {"a placeholder installed, another client's coordinator, coordination off",
-       [](Process& p, const testing::TempDir&) {
-         withPlaceholder(p.kc, "com.notes");
-         p.kc.putCoordinator(KCCoordinatorKind::RestoringDemoted, "com.other", 9);
-         p.kc.setCoordinationEnabled(false);
+      {"installs, progress, history and records put by a test",
+       [](Process& p, const testing::TempDir& dir) {
+         ASSERT_TRUE(p.ar.installApplication(makeBundle(dir, "Game", "com.game", "2.0"),
+                                             {{"PackageType", "Customer"},
+                                              {"BNBundleIdentifier", "com.game"},
+                                              {"ARInstallType", 4}},
+                                             nullptr));
+         // A placeholder's options may hold the null object (no SINF).
+         ASSERT_TRUE(p.ar.installApplication(
+             makeBundle(dir, "Notes", "com.notes", "1.1"),
+             {{"PackageType", "Placeholder"}, {"ApplicationSINF", plist::Value::null()}}));
+         auto loading = p.ar.installProgress("com.notes", ARInstallPhaseLoading);
+         loading->setTotalUnitCount(-1);
+         loading->cancel();
+         p.ar.installPhaseFinishedForProgress(loading);
+         p.ar.installProgress("com.notes", ARInstallPhaseInstalling)->setCompletedUnitCount(40);
+         p.ar.uninstallApplication("com.gone", plist::Dict{{"UninstallPlaceholdersOnly", true}});
+         p.ar.setInstallsInProgress({"com.notes"}, {"com.game", "com.unknown"});
+         p.ar.putApplication({.identifier = "com.sys", .applicationType = "System"});
+         p.ar.putApplication({.identifier = "com.plugin", .isApplication = false});
+         p.ar.putApplication(
+             {.identifier = "com.a", .staticDiskUsage = 9, .hasMIDBasedSINF = true});
        }},
+      {"coordinators, every promise kind, coordination off", everyPromiseKind},
   };
   for (const auto& [name, build] : cases) {
     SCOPED_TRACE(name);
@@ -192,7 +139,20 @@ TEST(FakeKCStateTest, ALoadedServiceIsTheOneSaved) {
     Process saved(dir), loaded(dir);
     build(saved, dir);
     saved.handOver(loaded);
+    EXPECT_EQ(loaded.ar.saveState(), saved.ar.saveState());
     EXPECT_EQ(loaded.kc.saveState(), saved.kc.saveState());
+    EXPECT_TRUE(loaded.ar.applications() == saved.ar.applications());
+    EXPECT_TRUE(loaded.ar.installCalls() == saved.ar.installCalls());
+    EXPECT_TRUE(loaded.ar.uninstallCalls() == saved.ar.uninstallCalls());
+    for (const auto& record : saved.ar.applications()) {
+      if (!record.isApplication) continue;
+      EXPECT_EQ(proxyText(loaded.ar.applicationProxyForIdentifier(record.identifier, true)),
+                proxyText(saved.ar.applicationProxyForIdentifier(record.identifier, true)));
+    }
+    // The proxy and the registry share the current progress again.
+    if (auto proxy = loaded.ar.applicationProxyForIdentifier("com.notes", true)) {
+      EXPECT_EQ(proxy->installProgressSync, loaded.ar.installProgress("com.notes", 1));
+    }
   }
 }
 
@@ -222,9 +182,11 @@ TEST(FakeKCStateTest, ALaterProcessCarriesOnWithALoadedCoordinator) {
       KCCoordinatorKind::Any, "com.game", kSyncClient, false, nullptr, nullptr);
   ASSERT_TRUE(loaded);
   loaded->setObserver(&recorder);
+  auto id = [](const auto& promise) {
+    return FakeKCInstallCoordination::promiseIdentifier(*promise);
+  };
   auto loadedAsset = loaded->appAssetPromiseWithError(nullptr);
-  EXPECT_EQ(FakeKCInstallCoordination::promiseIdentifier(*loadedAsset),
-            FakeKCInstallCoordination::promiseIdentifier(*asset));
+  EXPECT_EQ(id(loadedAsset), id(asset));
   loadedAsset->setComplete(true);
   Coordinator other = second.kc.coordinator("com.other");
   other->setObserver(&recorder);
@@ -234,54 +196,38 @@ TEST(FakeKCStateTest, ALaterProcessCarriesOnWithALoadedCoordinator) {
   EXPECT_EQ(recorder.events, (std::vector<std::string>{"complete com.game", "cancel com.other"}));
   EXPECT_TRUE(second.ar.applicationIsInstalled("com.game"));
   EXPECT_FALSE(second.ar.application("com.other")) << "the placeholder goes with its coordinator";
-  EXPECT_EQ(FakeKCInstallCoordination::promiseIdentifier(
-                *second.kc.initPromisedOutOfBandTransfer("next", kSyncClient, 0)),
-            FakeKCInstallCoordination::promiseIdentifier(
-                *first.kc.initPromisedOutOfBandTransfer("next", kSyncClient, 0)));
+  EXPECT_EQ(id(second.kc.initPromisedOutOfBandTransfer("next", kSyncClient, 0)),
+            id(first.kc.initPromisedOutOfBandTransfer("next", kSyncClient, 0)));
 }
 
-plist::Dict& at(plist::Dict& dict, std::string_view key) { return *dict.find(key)->dict(); }
-plist::Dict& item(plist::Dict& dict, std::string_view key, std::size_t i) {
-  return *(*dict.find(key)->array())[i].dict();
+plist::Dict& game(plist::Dict& s) {
+  return *s.find("coordinators")->dict()->find("com.game")->dict();
+}
+plist::Dict& record(plist::Dict& s, std::size_t i) {
+  return *(*s.find("applications")->array())[i].dict();
 }
 
 TEST(FakeStateTest, ADamagedStateIsRefusedByTheFieldAndChangesNothing) {
   struct Case {
-    const char* name;
     bool registry;
     std::function<void(plist::Dict&)> damage;
     std::string message;
   };
   const Case cases[] = {
-      {"install type as text", true,
-       [](plist::Dict& s) { item(s, "applications", 0).set("installType", "four"); },
+      {true, [](plist::Dict& s) { record(s, 0).set("installType", "four"); },
        "applications[0].installType: expected an unsigned integer"},
-      {"no identifier", true,
-       [](plist::Dict& s) { item(s, "applications", 1).erase("identifier"); },
+      {true, [](plist::Dict& s) { record(s, 1).erase("identifier"); },
        "applications[1].identifier: missing"},
-      {"current progress never saved", true,
-       [](plist::Dict& s) { item(s, "applications", 0).set("currentProgressPhase", 7); },
+      {true, [](plist::Dict& s) { record(s, 0).set("currentProgressPhase", 7); },
        "applications[0].currentProgressPhase: no install progress of com.a for that phase"},
-      {"percentage as text", false,
+      {false,
        [](plist::Dict& s) {
-         at(at(at(s, "coordinators"), "com.game"), "appAssetPromise").set("percentComplete", "½");
+         game(s).find("appAssetPromise")->dict()->set("percentComplete", "half");
        },
        "coordinators.com.game.appAssetPromise.percentComplete: expected a number"},
-      {"unknown kind", false,
-       [](plist::Dict& s) { at(at(s, "coordinators"), "com.game").set("kind", "sideways"); },
+      {false, [](plist::Dict& s) { game(s).set("kind", "sideways"); },
        "coordinators.com.game.kind: expected one of any, initiating, updating, restoring, "
        "restoringDemoted"},
-      {"error without domain", false,
-       [](plist::Dict& s) { at(at(s, "coordinators"), "com.game").set("error", plist::Dict{}); },
-       "coordinators.com.game.error.domain: missing"},
-      {"asset delivered out of band", false,
-       [](plist::Dict& s) {
-         at(at(at(s, "coordinators"), "com.game"), "appAssetPromise")
-             .set("kind", "outOfBandTransfer");
-       },
-       "coordinators.com.game.appAssetPromise.kind: expected transferToPath"},
-      {"no next identifier", false, [](plist::Dict& s) { s.erase("nextPromiseIdentifier"); },
-       "nextPromiseIdentifier: missing"},
   };
   testing::TempDir dir;
   Process built(dir), target(dir);
@@ -291,7 +237,7 @@ TEST(FakeStateTest, ADamagedStateIsRefusedByTheFieldAndChangesNothing) {
   everyPromiseKind(built, dir);
   built.handOver(target);
   for (const Case& c : cases) {
-    SCOPED_TRACE(c.name);
+    SCOPED_TRACE(c.message);
     plist::Dict state = c.registry ? built.ar.saveState() : built.kc.saveState();
     c.damage(state);
     try {
