@@ -35,10 +35,11 @@ class FakeService {
 
   const std::string& serviceName() const { return serviceName_; }
 
-  // The scripts as saved state: operation name -> {"calls", "failing"?: {"error", "times"?}},
-  // for every operation ("times" absent: every call fails). loadScripts replaces every count and
-  // script; an operation the file does not name starts afresh. Throws StateFormatError for an
-  // operation this service does not have or a failure of one that cannot fail.
+  // The scripts as saved state: operation name -> {"calls", "failing"?: {"error", "times"?}}
+  // ("times" absent: every call fails), for every operation called or failing. loadScripts
+  // replaces every count and script; an operation the state does not name has no calls and
+  // succeeds. Throws StateFormatError for an operation this service does not have, or a failure
+  // of one that cannot fail.
   plist::Dict saveScripts() const;
   void loadScripts(const StateFields& scripts);
 
