@@ -18,6 +18,7 @@
 #include "platform/fake/fake_system.h"
 #include "platform/fake/fake_tr.h"
 #include "platform/fake/fake_transaction_log.h"
+#include "platform/fake/state_fields.h"
 #include "platform/icon/home_screen_icon_service.h"
 #include "platform/platform.h"
 
