@@ -3,6 +3,7 @@
 #include <CLI/CLI.hpp>
 
 #include "commands.h"
+#include "input_error.h"
 
 int main(int argc, char** argv) {
   CLI::App app{"appsync-host: drive the application-sync plugin against a simulated device"};
@@ -15,7 +16,9 @@ int main(int argc, char** argv) {
   try {
     app.parse(argc, argv);
   } catch (const CLI::ParseError& e) {
-    return app.exit(e);
+    // Help is success; any other mistake on the command line is bad input.
+    const int printed = app.exit(e);
+    return printed == 0 ? 0 : appsync::host::kExitBadInput;
   }
   return status;
 }
