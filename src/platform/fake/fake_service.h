@@ -8,6 +8,7 @@
 #include <mutex>
 #include <string>
 #include <string_view>
+#include <vector>
 
 #include "runtime/error.h"
 
@@ -31,6 +32,12 @@ class FakeService {
   std::size_t callCount(std::string_view operation) const;
 
   const std::string& serviceName() const { return serviceName_; }
+
+  // Whether failOperation and succeedOperation take `operation`: the service has it and it can
+  // fail. Lets a caller with names from outside (a script) refuse a bad one instead of aborting.
+  bool knowsOperation(std::string_view operation) const;
+  // The operations failOperation takes, sorted.
+  std::vector<std::string> operationNames() const;
 
  protected:
   struct OperationSpec {
