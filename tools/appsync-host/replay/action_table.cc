@@ -102,6 +102,12 @@ plist::Bytes readDataOrPlist(const YamlField& field) {
   return *bytes;
 }
 
+std::string clientPath(const std::filesystem::path& root, const std::string& text) {
+  std::string base = root.string();
+  while (base.size() > 1 && base.back() == '/') base.pop_back();
+  return base + (text.starts_with('/') ? "" : "/") + text;
+}
+
 std::string shownPath(const std::filesystem::path& root, const std::string& path) {
   const std::filesystem::path full(path);
   const std::filesystem::path relative = full.lexically_relative(root);

@@ -47,6 +47,10 @@ plist::Dict readDict(const YamlField& field);
 plist::Bytes readDataOrPlist(const YamlField& field);
 plist::Bytes readData(const YamlField& field);
 
+// A device path handed to the client as an argument (an asset's path): resolved under the root
+// as the client's own paths are ("var/x" and "/var/x" both give ROOT/var/x) and otherwise passed
+// as written, ".." included: confining what the host hands over is the client's job.
+std::string clientPath(const std::filesystem::path& root, const std::string& text);
 // A path the client handed out, shown relative to the device root when it lies under it.
 std::string shownPath(const std::filesystem::path& root, const std::string& path);
 

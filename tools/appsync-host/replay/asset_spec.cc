@@ -4,7 +4,6 @@
 #include <optional>
 #include <string>
 
-#include "device_files.h"
 #include "replay/action_table.h"
 
 namespace appsync::host::replay {
@@ -15,7 +14,7 @@ std::optional<std::string> readPath(const YamlField& field, std::string_view key
                                     const std::filesystem::path& root) {
   auto value = field.optional(key);
   if (!value) return std::nullopt;
-  return devicePath(root, *value).string();
+  return clientPath(root, value->string());
 }
 
 void setShownPath(plist::Dict& dict, std::string key, const std::optional<std::string>& path,

@@ -12,8 +12,8 @@ namespace appsync::host::replay {
 
 // A TRAsset from a mapping:
 //   identifier (required), dataclass (default "Application"), prettyName,
-//   path, infoPlist, storePlist, icon   (device paths relative to the root; handed to the client
-//                                         as full paths under it),
+//   path, infoPlist, storePlist, icon   (device paths, resolved under the root and otherwise
+//                                         handed over as written: see clientPath),
 //   download, restore (booleans, default false), completedParts (unsigned), storePID (integer),
 //   variantOptions (a mapping, as a property list), downloadProgress, installProgress (numbers).
 // Throws InputError naming the field.

@@ -16,7 +16,6 @@
 #include <string>
 #include <vector>
 
-#include "device_files.h"
 #include "platform/fake/fake_sw.h"
 #include "platform/tr_client.h"
 #include "replay/action_table.h"
@@ -97,9 +96,9 @@ std::shared_ptr<TRAsset> asset(const StepContext& c) {
   return readAsset(c.step["asset"], c.session.root());
 }
 
-// A path the backup system asks about: relative to the device root in the script.
+// A path the backup system asks about, handed over as written (under the root).
 std::string backupPath(const StepContext& c) {
-  return devicePath(c.session.root(), c.step["path"]).string();
+  return clientPath(c.session.root(), c.step["path"].string());
 }
 
 // Runs `run` with a backup manager of the device's backup service (made without counting a

@@ -26,24 +26,22 @@ std::shared_ptr<FakeKCAppInstallCoordinator> coordinatorOf(StepContext& s) {
 
 // The promise `which` (asset, user-data, icon, spr: the first SPR promise) of the coordinator.
 std::shared_ptr<KCPromise> promiseOf(StepContext& s) {
-  auto coordinator = coordinatorOf(s);
   const YamlField field = s.step["promise"];
   const std::string which = field.string();
+  if (which != "asset" && which != "user-data" && which != "icon" && which != "spr") {
+    field.fail("unknown promise \"" + which + "\" (expected one of: asset, user-data, icon, spr)");
+  }
+  auto coordinator = coordinatorOf(s);
   FakeKCAppInstallCoordinator::Snapshot state = coordinator->snapshot();
   std::shared_ptr<KCPromise> promise;
-  if (which == "asset") {
-    promise = state.appAssetPromise;
-  } else if (which == "user-data") {
-    promise = state.userDataPromise;
-  } else if (which == "icon") {
+  if (which == "asset") promise = state.appAssetPromise;
+  if (which == "user-data") promise = state.userDataPromise;
+  if (which == "icon") {
     if (auto* placeholder = dynamic_cast<FakeKCPlaceholder*>(state.placeholder.get())) {
       promise = placeholder->iconPromise();
     }
-  } else if (which == "spr") {
-    if (!state.sprPromises.empty()) promise = state.sprPromises.front();
-  } else {
-    field.fail("unknown promise \"" + which + "\" (expected one of: asset, user-data, icon, spr)");
   }
+  if (which == "spr" && !state.sprPromises.empty()) promise = state.sprPromises.front();
   if (!promise) {
     throw StepFailed("the coordinator of " + coordinator->bundleID() + " holds no " + which +
                      " promise");
