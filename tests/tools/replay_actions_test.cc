@@ -10,6 +10,8 @@
 #include "client/apps_client.h"
 #include "device_session.h"
 #include "input_error.h"
+#include "platform/fake/fake_kc_objects.h"
+#include "platform/icon/png_codec.h"
 #include "platform/tr_client.h"
 #include "replay/step_context.h"
 #include "runtime/fs/files.h"
@@ -238,6 +240,56 @@ TEST_F(ReplayActionsTest, PlatformChangesReachTheFakes) {
   EXPECT_TRUE(
       device.sw().newManager()->restoreDataExistsForApplicationWithBundleID("com.b", &size));
   EXPECT_EQ(size, 4096u);
+}
+
+TEST_F(ReplayActionsTest, PluginOperationsWorkOnWhatTheHostComputerStaged) {
+  run("{stage: todo, list: [{identifier: com.a, operation: install}]}");
+  run("{plugin: changeAssetID, app: com.a, state: DOWNLOADED}");
+  const auto list = loadTodoList(session_->device().tr(), session_->paths().todoList(), nullptr);
+  ASSERT_TRUE(list && list->size() == 1 && (*list)[0].dict());
+  EXPECT_EQ(*(*list)[0].dict()->find("operation"), plist::Value("DOWNLOADED"));
+
+  session_->device().pv().setIconOrder({"com.b"});
+  const plist::Array ordered{plist::Dict{{"BNBundleIdentifier", "com.b"}},
+                             plist::Dict{{"BNBundleIdentifier", "com.a"}}};
+  EXPECT_EQ(run("{plugin: orderTheItems, apps: [com.a, com.b]}"), plist::Value(ordered));
+
+  run("{plugin: setRestoreStateProperty, app: com.a, version: '1.0', key: path, value: x.zip}");
+  EXPECT_EQ(run("{plugin: restoreStateProperty, app: com.a, version: '1.0', key: path}"),
+            plist::Value("x.zip"));
+  run("{plugin: cleanRestoreState, app: com.a}");
+  EXPECT_EQ(run("{plugin: restoreStateProperty, app: com.a, version: '1.0', key: path}"),
+            std::nullopt);
+
+  run("{stage: app, identifier: com.a, name: A, storeMetadata: {itemName: A}, artwork: true}");
+  const std::string dir = *session_->paths().packageDirectory("com.a");
+  const auto metadata =
+      plist::parse(readFile(Paths::packageMetadata(dir)).value_or(plist::Bytes{}));
+  EXPECT_EQ(metadata, plist::Value(plist::Dict{{"itemName", "A"}}));
+  std::string why;
+  EXPECT_TRUE(icon::decodePng(readFile(Paths::packageArtwork(dir)).value_or(plist::Bytes{}), &why))
+      << why;
+}
+
+TEST_F(ReplayActionsTest, CoordinatorEventsActOnTheCoordinationService) {
+  FakeKCInstallCoordination& kc = session_->device().kc();
+  auto coordinator = kc.putCoordinator(KCCoordinatorKind::Initiating, "com.c", KCClientBazaar);
+  coordinator->setAppAssetPromiseResponsibleClient(KCClientBazaar, nullptr);
+  run("{stage: package, identifier: com.c, name: C}");
+  run("{event: store-download, app: com.c, package: var/mobile/Media/PublicStaging/C.app}");
+  auto promise = coordinator->appAssetPromiseWithError(nullptr);
+  ASSERT_TRUE(promise);
+  EXPECT_TRUE(promise->isComplete());
+  EXPECT_EQ(promise->transferPath(), (root() / "var/mobile/Media/PublicStaging/C.app").string());
+
+  run("{event: promise-began, app: com.c, promise: asset}");
+  EXPECT_THROW(run("{event: promise-began, app: com.c, promise: user-data}"), StepFailed);
+  run("{event: coordinator-cancelled, app: com.c, client: 1, "
+      "reason: {domain: KCErrorDomain, code: 10, description: user}}");
+  EXPECT_EQ(coordinator->state(), FakeKCAppInstallCoordinator::State::Cancelled);
+  ASSERT_TRUE(coordinator->error());
+  EXPECT_EQ(coordinator->error()->code, 10);
+  EXPECT_THROW(run("{event: coordinator-prioritize, app: com.c}"), StepFailed);  // forgotten
 }
 
 TEST(ReplayEventsTest, StartupInsideTheHostDaemonCreatesTheCoordinationObserver) {
