@@ -92,7 +92,7 @@ ErrorRef optionalError(const StepContext& c) {
   return field ? readError(*field) : nullptr;
 }
 
-std::shared_ptr<TRAsset> asset(const StepContext& c) {
+std::shared_ptr<TRAsset> assetOf(const StepContext& c) {
   return readAsset(c.step["asset"], c.session.root());
 }
 
@@ -248,7 +248,7 @@ const std::vector<HostCall>& hostCalls() {
       {Op::assetTransferSucceeded,
        {"asset", "succeeded", "error"},
        [](StepContext& s) -> Invocation {
-         auto a = asset(s);
+         auto a = assetOf(s);
          bool succeeded = s.step["succeeded"].boolean();
          ErrorRef error = optionalError(s);
          return noResult(
@@ -257,7 +257,7 @@ const std::vector<HostCall>& hostCalls() {
       {Op::assetTransferUpdatedProgress,
        {"asset", "progress"},
        [](StepContext& s) -> Invocation {
-         auto a = asset(s);
+         auto a = assetOf(s);
          double progress = s.step["progress"].real();
          return noResult([a, progress](TRClient& c) { c.assetTransfer(a, progress); });
        }},
@@ -270,13 +270,13 @@ const std::vector<HostCall>& hostCalls() {
       {Op::assetInstallSucceeded,
        {"asset"},
        [](StepContext& s) -> Invocation {
-         auto a = asset(s);
+         auto a = assetOf(s);
          return noResult([a](TRClient& c) { c.assetInstallSucceeded(a); });
        }},
       {Op::assetInstallFailed,
        {"asset", "error"},
        [](StepContext& s) -> Invocation {
-         auto a = asset(s);
+         auto a = assetOf(s);
          ErrorRef error = optionalError(s);
          return noResult([a, error](TRClient& c) { c.assetInstallFailed(a, error); });
        }},
@@ -284,7 +284,7 @@ const std::vector<HostCall>& hostCalls() {
        {"metadata", "asset", "newAnchor"},
        [](StepContext& s) -> Invocation {
          plist::Dict metadata = readDict(s.step["metadata"]);
-         auto a = asset(s);
+         auto a = assetOf(s);
          std::string anchor = s.step["newAnchor"].string();
          return noResult(
              [metadata, a, anchor](TRClient& c) { c.metadataUpdate(metadata, a, anchor); });
@@ -292,7 +292,7 @@ const std::vector<HostCall>& hostCalls() {
       {Op::prioritizeAsset,
        {"asset"},
        [](StepContext& s) -> Invocation {
-         auto a = asset(s);
+         auto a = assetOf(s);
          return noResult([a](TRClient& c) { c.prioritizeAsset(a); });
        }},
       {Op::initiateAssetDownloadsWithCompletion,

@@ -60,7 +60,7 @@ plist::Bytes artworkFor(const std::string& identifier) {
   return *png;
 }
 
-std::string versionOf(const StepContext& s) {
+std::string packageVersion(const StepContext& s) {
   auto field = s.step.optional("version");
   return field ? field->string() : std::string("1.0");
 }
@@ -74,7 +74,7 @@ ActionResult stageApp(StepContext& s) {
   const fs::path& root = s.session.root();
   const fs::path dir = fixedPath(s, *directory, idField);
   plist::Dict info{{"BNBundleIdentifier", identifier},
-                   {"BNBundleVersion", versionOf(s)},
+                   {"BNBundleVersion", packageVersion(s)},
                    {"BNBundleDisplayName", s.step["name"].string()}};
   const auto metadata = s.step.optional("storeMetadata");
   const plist::Value storeMetadata = metadata ? plist::Value(readDict(*metadata)) : plist::Value();
@@ -94,7 +94,7 @@ ActionResult stagePackage(StepContext& s) {
   BundleSpec spec;
   spec.identifier = s.step["identifier"].string();
   spec.name = s.step["name"].string();
-  spec.version = versionOf(s);
+  spec.version = packageVersion(s);
   if (auto info = s.step.optional("info")) spec.extraInfo = readDict(*info);
   if (auto icon = s.step.optional("icon")) spec.withIcon = icon->boolean();
 

@@ -48,7 +48,7 @@ std::string operationOf(StepContext& s, const FakeService& service) {
   return operation;
 }
 
-ActionResult fail(StepContext& s) {
+ActionResult scriptFailure(StepContext& s) {
   FakeService& service = serviceNamed(s);
   const std::string operation = operationOf(s, service);
   int times = FakeService::kEveryCall;
@@ -62,7 +62,7 @@ ActionResult fail(StepContext& s) {
   return std::nullopt;
 }
 
-ActionResult succeed(StepContext& s) {
+ActionResult scriptSuccess(StepContext& s) {
   FakeService& service = serviceNamed(s);
   service.succeedOperation(operationOf(s, service));
   return std::nullopt;
@@ -95,7 +95,7 @@ ActionResult denyAssertions(StepContext& s) {
 }
 
 // A restriction setting: true (explicitly allowed), false (explicitly restricted) or none.
-ActionResult restrict(StepContext& s) {
+ActionResult setRestriction(StepContext& s) {
   const YamlField settingField = s.step["setting"];
   const std::string setting = settingField.string();
   if (setting != RSFeatureAppInstallationAllowed && setting != RSFeatureAppRemovalAllowed) {
@@ -162,10 +162,10 @@ ActionResult backupData(StepContext& s) {
 
 const std::vector<ActionSpec>& platformTable() {
   static const std::vector<ActionSpec> table = {
-      {"fail", {"service", "operation", "times", "error"}, fail},
-      {"succeed", {"service", "operation"}, succeed},
+      {"fail", {"service", "operation", "times", "error"}, scriptFailure},
+      {"succeed", {"service", "operation"}, scriptSuccess},
       {"deny-assertions", {"app", "times", "outcome"}, denyAssertions},
-      {"restrict", {"setting", "value"}, restrict},
+      {"restrict", {"setting", "value"}, setRestriction},
       {"install-app", {"identifier", "name", "version", "storeMetadata"}, installApp},
       {"remove-app", {"app"}, removeApp},
       {"backup-data", {"app", "size"}, backupData},

@@ -69,7 +69,7 @@ void holdOrRelease(StepContext& s, bool hold) {
   hold ? thread->hold() : thread->release();
 }
 
-ActionResult startup(StepContext& s) {
+ActionResult postStartup(StepContext& s) {
   FakePlatform& device = s.session.device();
   // Posting waits for the delivery, which a held notification center never makes; only a step
   // running in the background may wait for a later release.
@@ -86,7 +86,7 @@ ActionResult startup(StepContext& s) {
 
 const std::vector<ActionSpec>& eventTable() {
   static const std::vector<ActionSpec> table = {
-      {"startup", {}, startup},
+      {"startup", {}, postStartup},
       {"installs-prioritized",
        {"prioritized", "paused"},
        [](StepContext& s) -> ActionResult {

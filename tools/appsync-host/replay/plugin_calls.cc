@@ -20,9 +20,9 @@ namespace appsync::host::replay {
 
 namespace {
 
-std::string app(const StepContext& c) { return c.step["app"].string(); }
+std::string appOf(const StepContext& c) { return c.step["app"].string(); }
 
-std::optional<std::string> version(const StepContext& c) {
+std::optional<std::string> versionOf(const StepContext& c) {
   auto field = c.step.optional("version");
   return field ? std::optional<std::string>(field->string()) : std::nullopt;
 }
@@ -48,7 +48,7 @@ const std::vector<ActionSpec>& pluginTable() {
       {"changeAssetID",
        {"app", "state"},
        [](StepContext& s) -> ActionResult {
-         s.session.client().changeAssetID(app(s), s.step["state"].string());
+         s.session.client().changeAssetID(appOf(s), s.step["state"].string());
          return std::nullopt;
        }},
       {"notifyPavilion",
@@ -72,7 +72,7 @@ const std::vector<ActionSpec>& pluginTable() {
       {"processCaravelRestoreInfoForApp",
        {"app", "metadata", "sinf", "icon"},
        [](StepContext& s) -> ActionResult {
-         std::string bundleID = app(s);
+         std::string bundleID = appOf(s);
          plist::Bytes metadata = readDataOrPlist(s.step["metadata"]);
          auto sinf = optionalData(s, "sinf");
          auto icon = optionalData(s, "icon");
@@ -82,29 +82,29 @@ const std::vector<ActionSpec>& pluginTable() {
       {"setRestoreStateProperty",
        {"app", "version", "key", "value"},
        [](StepContext& s) -> ActionResult {
-         std::string bundleID = app(s);
+         std::string bundleID = appOf(s);
          plist::Value value = s.step["value"].plist();
          s.session.client()._setRestoreStatePropertyValue(value, s.step["key"].string(), bundleID,
-                                                          version(s));
+                                                          versionOf(s));
          return std::nullopt;
        }},
       {"restoreStateProperty",
        {"app", "version", "key"},
        [](StepContext& s) -> ActionResult {
-         std::string bundleID = app(s);
+         std::string bundleID = appOf(s);
          return s.session.client()._restoreStatePropertyForKey(s.step["key"].string(), bundleID,
-                                                               version(s));
+                                                               versionOf(s));
        }},
       {"cleanRestoreState",
        {"app"},
        [](StepContext& s) -> ActionResult {
-         s.session.client().cleanRestoreStateForIdentifier(app(s));
+         s.session.client().cleanRestoreStateForIdentifier(appOf(s));
          return std::nullopt;
        }},
       {"placeholderExists",
        {"app"},
        [](StepContext& s) -> ActionResult {
-         return plist::Value(s.session.client()._placeholderExistsForApplication(app(s)));
+         return plist::Value(s.session.client()._placeholderExistsForApplication(appOf(s)));
        }},
       {"createPlaceHolderApplication",
        {"asset"},
