@@ -8,6 +8,7 @@
 #include <mutex>
 #include <string>
 #include <string_view>
+#include <vector>
 
 #include "runtime/error.h"
 #include "runtime/plist/value.h"
@@ -42,6 +43,12 @@ class FakeService {
   // of one that cannot fail.
   plist::Dict saveScripts() const;
   void loadScripts(const StateFields& scripts);
+
+  // Whether failOperation and succeedOperation take `operation`: the service has it and it can
+  // fail. Lets a caller with names from outside (a script) refuse a bad one instead of aborting.
+  bool knowsOperation(std::string_view operation) const;
+  // The operations failOperation takes, sorted.
+  std::vector<std::string> operationNames() const;
 
  protected:
   struct OperationSpec {
