@@ -193,8 +193,8 @@ void homeScreenSection(Sections& out, const json& home) {
   out.heading("Home screen");
   const json& state = home.at("syncNotificationState");
   out.text("sync notification " + cellText(home.at("syncNotification")) + ": " +
-           (state.is_null() ? std::string("no state") : "state " + cellText(state)) + ", posted " +
-           cellText(home.at("syncNotificationPosts")) + " times");
+           (state.is_null() ? std::string("no state") : "state " + cellText(state)) + "; posts " +
+           cellText(home.at("syncNotificationPosts")));
   const json& icons = home.at("iconState");
   if (icons.is_null()) return out.text("icon layout: never set");
   if (!home.at("iconStateError").is_null()) {
