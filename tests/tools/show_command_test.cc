@@ -3,18 +3,24 @@
 #include <gtest/gtest.h>
 
 #include <cstdint>
+#include <cstdlib>
 #include <filesystem>
 #include <limits>
+#include <map>
 #include <string>
 #include <vector>
 
+#include "device_lock.h"
+#include "device_session.h"
 #include "device_table.h"
 #include "device_view.h"
+#include "input_error.h"
 #include "platform/fake/fake_kc_objects.h"
 #include "platform/fake/fake_platform.h"
 #include "plist_json.h"
 #include "runtime/plist/codec.h"
 #include "runtime/plist/text_encoding.h"
+#include "support/host_process.h"
 #include "support/temp_dir.h"
 #include "support/text_file.h"
 
@@ -230,6 +236,60 @@ TEST_F(ShowViewTest, TablesAreAlignedAndPlainUnlessStyled) {
   EXPECT_EQ(placeholder.find("placeholder"), heading.find("KIND")) << table;
   EXPECT_EQ(table.find('\033'), std::string::npos);
   EXPECT_NE(renderDeviceTable(collect(), true).find("\033[1m"), std::string::npos);
+}
+
+// Every file under `directory` with its bytes.
+std::map<std::string, std::string> filesUnder(const std::filesystem::path& directory) {
+  std::map<std::string, std::string> files;
+  for (const auto& entry : std::filesystem::recursive_directory_iterator(directory)) {
+    if (entry.is_regular_file()) files[entry.path().string()] = testing::readText(entry.path());
+  }
+  return files;
+}
+
+TEST(ShowCommandTest, ShowsADeviceSavedByAnotherProcessAndChangesNothing) {
+  const char* host = std::getenv("APPSYNC_HOST");
+  ASSERT_NE(host, nullptr) << "APPSYNC_HOST is not set";
+  testing::TempDir dir;
+  const auto root = dir.path() / "device";
+  {
+    auto session = DeviceSession::create(root, {.coordination = true});
+    session->device().ar().putApplication({.identifier = "com.a", .version = "1.0"});
+    session->device().ar().putApplication({.identifier = "com.b", .isPlaceholder = true});
+    session->device().em().addUninstalled("com.gone");
+    session->close();
+  }
+  const auto show = [&](const std::string& arguments) {
+    return testing::runHost(host, "show --root '" + root.string() + "' " + arguments, dir.path());
+  };
+  const auto before = filesUnder(DeviceSession::stateDirectory(root));
+  ASSERT_FALSE(before.empty());
+
+  const testing::HostRun asJson = show("--json");
+  ASSERT_EQ(asJson.status, 0) << asJson.stderrText;
+  const json view = json::parse(asJson.stdoutText);
+  ASSERT_EQ(view["registry"].size(), 2u);
+  EXPECT_EQ(view["registry"][0]["kind"], "installed");
+  EXPECT_EQ(view["registry"][1]["kind"], "placeholder");
+  EXPECT_EQ(view["installer"]["uninstalled"], json::array({"com.gone"}));
+
+  const testing::HostRun asTable = show("--lines 3");
+  ASSERT_EQ(asTable.status, 0) << asTable.stderrText;
+  EXPECT_NE(rowOf(asTable.stdoutText, "com.b").find(" placeholder "), std::string::npos)
+      << asTable.stdoutText;
+  EXPECT_EQ(asTable.stdoutText.find('\033'), std::string::npos);
+  EXPECT_EQ(filesUnder(DeviceSession::stateDirectory(root)), before);
+
+  {
+    const DeviceLock held = DeviceLock::acquire(DeviceSession::stateDirectory(root));
+    const testing::HostRun busy = show("");
+    EXPECT_EQ(busy.status, kExitFailed) << busy.stderrText;
+    EXPECT_FALSE(busy.stderrText.empty());
+  }
+  const testing::HostRun noDevice =
+      testing::runHost(host, "show --root '" + dir.str() + "'", dir.path());
+  EXPECT_EQ(noDevice.status, kExitBadInput);
+  EXPECT_NE(noDevice.stderrText.find("holds no device"), std::string::npos) << noDevice.stderrText;
 }
 
 }  // namespace
