@@ -132,24 +132,21 @@ TEST_F(ShowViewTest, GathersEveryService) {
              plist::Dict{{"com.b", plist::Dict{{"2.0", plist::Dict{{"path", "/x/B.zip"}}}}}});
   const json view = collect();
 
-  ASSERT_EQ(view["registry"].size(), 3u);
-  EXPECT_EQ(view["registry"][0]["kind"], "installed");
-  EXPECT_EQ(view["registry"][0]["staticDiskUsage"], 4096);
-  EXPECT_EQ(view["registry"][1]["kind"], "placeholder");
-  EXPECT_EQ(view["registry"][2]["kind"], "bundle");
+  std::vector<std::string> kinds;
+  for (const json& app : view["registry"]) kinds.push_back(app["kind"]);
+  EXPECT_EQ(kinds, (std::vector<std::string>{"installed", "placeholder", "bundle"}));
   EXPECT_EQ(view["restore"]["state"]["com.b"]["2.0"]["path"], "/x/B.zip");
   EXPECT_EQ(view["restore"]["listWaiting"], false);
   EXPECT_EQ(view["homeScreen"]["syncNotificationState"], 1);
   EXPECT_EQ(view["homeScreen"]["syncNotificationPosts"], 1);
-  EXPECT_EQ(view["homeScreen"]["iconState"]["iconLists"], json::array({json::array({"com.a"})}));
-  EXPECT_EQ(view["homeScreen"]["iconState"]["badge"]["data"], "3q0=");
+  EXPECT_EQ(view["homeScreen"]["iconState"],
+            (json{{"iconLists", {{"com.a"}}}, {"badge", {{"data", "3q0="}}}}));
   EXPECT_EQ(view["installer"]["uninstalled"], json::array({"com.gone"}));
-  EXPECT_EQ(view["restrictions"]["allowAppRemoval"], "no");
-  EXPECT_EQ(view["restrictions"]["allowAppInstallation"], "unset");
+  EXPECT_EQ(view["restrictions"],
+            (json{{"allowAppInstallation", "unset"}, {"allowAppRemoval", "no"}}));
   EXPECT_EQ(view["log"]["lines"], json::array({"two", "three"}));
   ASSERT_EQ(view["transactions"].size(), 2u);
   EXPECT_EQ(view["transactions"][0]["description"], "second");
-  EXPECT_EQ(view["transactions"][1]["kind"], "scenario");
   EXPECT_EQ(view["transactions"][1]["scenario"], "Asset install");
   EXPECT_EQ(json::parse(view.dump()), view);
 }
@@ -169,17 +166,12 @@ TEST_F(ShowViewTest, CoordinatorsWithTheirPlaceholderAndPromises) {
   ASSERT_EQ(view["coordinators"].size(), 1u);
   const json& c = view["coordinators"][0];
   EXPECT_EQ(c["kind"], "Restoring");
-  EXPECT_EQ(c["creator"], 7);
-  EXPECT_EQ(c["state"], "active");
   EXPECT_EQ(c["placeholder"]["configurationComplete"], true);
-  EXPECT_EQ(c["placeholderInstalled"], false);
   ASSERT_EQ(c["promises"].size(), 1u);
   EXPECT_EQ(c["promises"][0]["role"], "asset");
   EXPECT_EQ(c["promises"][0]["transferPath"], "/staging/B.zip");
   EXPECT_EQ(c["promises"][0]["percentComplete"], 0.25);
-  const std::string table = renderDeviceTable(view, false);
-  EXPECT_NE(table.find("Restoring"), std::string::npos) << table;
-  EXPECT_NE(table.find("25%"), std::string::npos) << table;
+  EXPECT_NE(renderDeviceTable(view, false).find("25%"), std::string::npos);
   kc.release();
 }
 
@@ -229,7 +221,6 @@ TEST_F(ShowViewTest, TablesAreAlignedAndPlainUnlessStyled) {
   const std::string placeholder = rowOf(table, "com.b");
   EXPECT_NE(installed.find(" installed "), std::string::npos) << table;
   EXPECT_NE(placeholder.find(" placeholder "), std::string::npos) << table;
-  EXPECT_EQ(placeholder.find("installed"), std::string::npos) << table;
   // Every registry row has its kind where the heading has KIND.
   const std::string heading = rowOf(table, "IDENTIFIER");
   EXPECT_EQ(installed.find("installed"), heading.find("KIND")) << table;
