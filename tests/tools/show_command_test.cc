@@ -206,13 +206,15 @@ TEST_F(ShowViewTest, TodoListEveryStateInItsRow) {
   EXPECT_EQ(records.back()["record"], "not a record");
 }
 
-TEST_F(ShowViewTest, AnUnreadableTodoListIsReportedNotLogged) {
-  put(device_.paths().todoList(), "<plist><array><string>broken");
-  const json view = collect();
-  EXPECT_EQ(view["todoList"]["present"], false);
-  EXPECT_TRUE(view["todoList"]["error"].is_string());
+TEST_F(ShowViewTest, AnUnusableTodoListIsReportedNotLogged) {
+  for (const char* text : {"<plist><array><string>broken", "<plist><dict/></plist>"}) {
+    put(device_.paths().todoList(), text);
+    const json view = collect();
+    EXPECT_EQ(view["todoList"]["present"], false) << text;
+    EXPECT_TRUE(view["todoList"]["error"].is_string()) << text;
+    EXPECT_NE(renderDeviceTable(view, false).find("unreadable"), std::string::npos) << text;
+  }
   EXPECT_TRUE(device_.log().lines().empty());
-  EXPECT_NE(renderDeviceTable(view, false).find("unreadable"), std::string::npos);
 }
 
 TEST_F(ShowViewTest, TablesAreAlignedAndPlainUnlessStyled) {

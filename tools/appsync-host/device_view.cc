@@ -181,7 +181,11 @@ json todoListJson(const std::string& path) {
                        {"version", todoFieldJson(*record, kTodoVersionKey)},
                        {"name", todoFieldJson(*record, kTodoNameKey)}});
   }
-  return {{"present", list.has_value()}, {"error", fileErrorJson(error)}, {"records", records}};
+  // A list of the wrong shape sets no error; the message the loader gave says why.
+  json why = fileErrorJson(error);
+  const std::vector<std::string> said = quietHost.logSink()->messages();
+  if (why.is_null() && !said.empty()) why = said.back();
+  return {{"present", list.has_value()}, {"error", why}, {"records", records}};
 }
 
 // A property-list file as JSON: {"value": ..., "error": ...}, both null when it is missing.
