@@ -231,11 +231,13 @@ TEST_F(ShowViewTest, TablesAreAlignedAndPlainUnlessStyled) {
   EXPECT_NE(renderDeviceTable(collect(), true).find("\033[1m"), std::string::npos);
 }
 
-// Every file under `directory` with its bytes.
+// Every saved state file under `directory` with its bytes (the lock file names its holder).
 std::map<std::string, std::string> filesUnder(const std::filesystem::path& directory) {
   std::map<std::string, std::string> files;
-  for (const auto& entry : std::filesystem::recursive_directory_iterator(directory)) {
-    if (entry.is_regular_file()) files[entry.path().string()] = testing::readText(entry.path());
+  for (const auto& entry : std::filesystem::directory_iterator(directory)) {
+    if (entry.path().extension() == ".plist") {
+      files[entry.path().string()] = testing::readText(entry.path());
+    }
   }
   return files;
 }

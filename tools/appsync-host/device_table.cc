@@ -87,7 +87,14 @@ std::string counted(const std::string& title, const json& items) {
   return title + " (" + std::to_string(items.size()) + ")";
 }
 
-void registrySection(Sections& out, const json& registry) {
+// A path under the device root, shown relative to it.
+std::string underRoot(const json& path, const std::string& root) {
+  std::string text = cellText(path);
+  const std::string prefix = root.ends_with('/') ? root : root + "/";
+  return text.starts_with(prefix) ? text.substr(prefix.size()) : text;
+}
+
+void registrySection(Sections& out, const json& registry, const std::string& root) {
   out.heading(counted("Registry", registry));
   if (registry.empty()) return out.text("no applications");
   TableText table({"IDENTIFIER", "KIND", "TYPE", "VERSION", "NAME", "INSTALL TYPE", "DISK USAGE",
@@ -96,7 +103,7 @@ void registrySection(Sections& out, const json& registry) {
     table.add({cellText(app.at("identifier")), cellText(app.at("kind")), cellText(app.at("type")),
                cellText(app.at("version")), cellText(app.at("name")),
                cellText(app.at("installType")), cellText(app.at("staticDiskUsage")),
-               cellText(app.at("hasMIDBasedSINF")), cellText(app.at("bundleDirectory"))});
+               cellText(app.at("hasMIDBasedSINF")), underRoot(app.at("bundleDirectory"), root)});
   }
   out.table(table);
 }
@@ -229,7 +236,7 @@ void linesSection(Sections& out, const std::string& title, const std::vector<std
 std::string renderDeviceTable(const nlohmann::json& view, bool styled) {
   Sections out(styled);
   out.heading("Device " + cellText(view.at("root")));
-  registrySection(out, view.at("registry"));
+  registrySection(out, view.at("registry"), cellText(view.at("root")));
   coordinationSection(out, view.at("coordinators"));
   todoSection(out, view.at("todoList"));
   restoreSection(out, view.at("restore"));

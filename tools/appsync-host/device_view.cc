@@ -292,7 +292,9 @@ std::vector<std::string> lastLinesOfFile(const std::filesystem::path& path, std:
 
 nlohmann::json collectDevice(FakePlatform& device, const std::filesystem::path& logFile,
                              std::size_t logLines) {
-  return {{"root", device.paths().root().string()},
+  std::error_code ec;
+  const std::filesystem::path root = std::filesystem::absolute(device.paths().root(), ec);
+  return {{"root", root.lexically_normal().string()},
           {"registry", registryJson(device.ar())},
           {"coordinators", coordinatorsJson(device.kc())},
           {"todoList", todoListJson(device.paths().todoList())},

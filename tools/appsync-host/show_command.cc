@@ -56,7 +56,8 @@ void addShowCommand(CLI::App& app, int& status) {
   command->add_option("--root", arguments->root, "The device's directory")->required();
   command->add_flag("--json", arguments->json, "One JSON object for scripts instead of tables");
   command->add_option("--lines", arguments->lines, "Lines of the log and transaction log to show")
-      ->capture_default_str();
+      ->capture_default_str()
+      ->check(CLI::Range(0, 1000000));
   command->callback([arguments, &status] { status = runShow(*arguments); });
 }
 
