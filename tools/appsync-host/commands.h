@@ -11,5 +11,6 @@ void addIconCommand(CLI::App& app, int& status);
 void addDemoCommand(CLI::App& app, int& status);
 // `device init`.
 void addDeviceCommands(CLI::App& app, int& status);
+void addShowCommand(CLI::App& app, int& status);
 
 }  // namespace appsync::host

@@ -13,6 +13,7 @@ int main(int argc, char** argv) {
   appsync::host::addPlistCommands(app, status);
   appsync::host::addIconCommand(app, status);
   appsync::host::addDeviceCommands(app, status);
+  appsync::host::addShowCommand(app, status);
   try {
     app.parse(argc, argv);
   } catch (const CLI::ParseError& e) {
