@@ -11,6 +11,7 @@ int main(int argc, char** argv) {
   appsync::host::addDemoCommand(app, status);
   appsync::host::addPlistCommands(app, status);
   appsync::host::addIconCommand(app, status);
+  appsync::host::addReplayCommand(app, status);
   try {
     app.parse(argc, argv);
   } catch (const CLI::ParseError& e) {
