@@ -5,6 +5,12 @@ namespace appsync::host::replay {
 
 namespace {
 
+// Texts in quotes, so that "1" and 1, or an empty text, can be told apart.
+std::string shown(const plist::Value& value) {
+  if (const std::string* text = value.string()) return "\"" + *text + "\"";
+  return value.describe();
+}
+
 std::string at(const std::string& path, const std::string& message) {
   return path.empty() ? message : path + ": " + message;
 }
@@ -19,13 +25,13 @@ std::optional<std::string> compare(const plist::Value& expected, const plist::Va
     for (const auto& entry : *expected.dict()) {
       const plist::Value* other = found.dict()->find(entry.key);
       if (!other) {
-        return at(key(path, entry.key), "expected " + entry.value.describe() + ", found nothing");
+        return at(key(path, entry.key), "expected " + shown(entry.value) + ", found nothing");
       }
       if (auto difference = compare(entry.value, *other, key(path, entry.key))) return difference;
     }
     for (const auto& entry : *found.dict()) {
       if (!expected.dict()->contains(entry.key)) {
-        return at(key(path, entry.key), "expected nothing, found " + entry.value.describe());
+        return at(key(path, entry.key), "expected nothing, found " + shown(entry.value));
       }
     }
     return std::nullopt;
@@ -35,14 +41,14 @@ std::optional<std::string> compare(const plist::Value& expected, const plist::Va
     const plist::Array& have = *found.array();
     for (std::size_t i = 0; i < want.size() || i < have.size(); ++i) {
       const std::string item = path + "[" + std::to_string(i) + "]";
-      if (i >= have.size()) return at(item, "expected " + want[i].describe() + ", found nothing");
-      if (i >= want.size()) return at(item, "expected nothing, found " + have[i].describe());
+      if (i >= have.size()) return at(item, "expected " + shown(want[i]) + ", found nothing");
+      if (i >= want.size()) return at(item, "expected nothing, found " + shown(have[i]));
       if (auto difference = compare(want[i], have[i], item)) return difference;
     }
     return std::nullopt;
   }
   if (expected == found) return std::nullopt;
-  return at(path, "expected " + expected.describe() + ", found " + found.describe());
+  return at(path, "expected " + shown(expected) + ", found " + shown(found));
 }
 
 }  // namespace

@@ -9,7 +9,7 @@ namespace appsync::host::replay {
 
 namespace {
 
-using nlohmann::json;
+using json = nlohmann::ordered_json;
 
 // Property lists as JSON: data as {"data": base64}, dates as {"date": ISO 8601}, archive
 // references as {"uid": N}.
