@@ -217,7 +217,12 @@ std::unique_ptr<DeviceSession> openScriptDevice(const Script& script, const fs::
   }
   const YamlField& description = *script.device;
   const FakePlatform::Options options = deviceOptions(&description);
-  if (fresh) removeDevice(root);
+  if (fresh) {
+    removeDevice(root);
+  } else if (fs::exists(DeviceSession::stateDirectory(root))) {
+    throw InputError(root.string(), 0, "",
+                     "already holds a device (--fresh replaces it with the script's)");
+  }
   auto session = DeviceSession::create(root, options);
   applyDescription(*session, &description);
   session->settle();
