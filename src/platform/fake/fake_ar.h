@@ -18,6 +18,7 @@
 #include "platform/ar.h"
 #include "platform/fake/callback_thread.h"
 #include "platform/fake/fake_service.h"
+#include "platform/fake/state_fields.h"
 
 namespace appsync {
 
@@ -70,6 +71,7 @@ class FakeARWorkspace final : public ARApplicationWorkspace, public FakeService 
     std::optional<std::uint64_t> staticDiskUsage{};
     bool hasMIDBasedSINF = false;
     plist::Dict lastInstallOptions{};  // options of the install that made it
+    bool operator==(const AppRecord&) const = default;
   };
 
   struct InstallCall {
@@ -77,11 +79,13 @@ class FakeARWorkspace final : public ARApplicationWorkspace, public FakeService 
     plist::Dict options;
     bool placeholder;  // installApplication:withOptions: (true) or ...:error: (false)
     bool succeeded;
+    bool operator==(const InstallCall&) const = default;
   };
   struct UninstallCall {
     std::string identifier;
     std::optional<plist::Dict> options;
     bool succeeded;
+    bool operator==(const UninstallCall&) const = default;
   };
 
   // Option of uninstallApplication: remove the application only if it is a placeholder.
@@ -123,6 +127,12 @@ class FakeARWorkspace final : public ARApplicationWorkspace, public FakeService 
   void notifyInstallsArePrioritized();
   // Delivers applicationInstallsDidCancel with the proxies of the known identifiers.
   void notifyInstallsDidCancel(const std::vector<std::string>& identifiers);
+
+  // Saved state (the simulator's device directory): every record, install progress, the
+  // prioritized and paused lists, the install and uninstall history. Observers are not state.
+  plist::Dict saveState() const;
+  // Replaces the whole state with a saved one, with no events. Throws StateFormatError.
+  void loadState(const StateFields& state);
 
   std::size_t observerCount() const;
   // Waits until every event posted so far has been delivered.

@@ -64,6 +64,7 @@
 #include "platform/fake/fake_kc_errors.h"
 #include "platform/fake/fake_kc_objects.h"
 #include "platform/fake/fake_service.h"
+#include "platform/fake/state_fields.h"
 #include "platform/kc.h"
 
 namespace appsync {
@@ -112,6 +113,15 @@ class FakeKCInstallCoordination final : public KCInstallCoordination, public Fak
 
   // --- Test API ---
   void setCoordinationEnabled(bool enabled);
+
+  // Saved state (the simulator's device directory): whether coordination is enabled, every
+  // current coordinator with its promises and placeholder, and the next promise identifier, so
+  // that promises keep their identifiers. Observers and observer registrations are not state.
+  plist::Dict saveState() const;
+  // Replaces the coordinators with saved ones, which a later client finds by bundle identifier
+  // and carries on with; each is then re-examined on the event thread, as after any change.
+  // Throws StateFormatError, with nothing replaced.
+  void loadState(const StateFields& state);
 
   // Puts a coordinator as another client would have made it (replacing any for the bundle).
   std::shared_ptr<FakeKCAppInstallCoordinator> putCoordinator(KCCoordinatorKind kind,

@@ -267,6 +267,18 @@ bool FakeKCAppInstallCoordinator::forgetObserver(const KCAppInstallObserverDeleg
   });
 }
 
+void FakeKCAppInstallCoordinator::restore(Snapshot saved, bool placedPlaceholderRecord) {
+  saved.observer = nullptr;
+  state_.set(saved);
+  placedPlaceholderRecord_.set(placedPlaceholderRecord);
+  for (const auto& promise : saved.sprPromises) attachPromise(promise);
+  attachPromise(saved.appAssetPromise);
+  attachPromise(saved.userDataPromise);
+  if (auto* placeholder = dynamic_cast<FakeKCPlaceholder*>(saved.placeholder.get())) {
+    placeholder->handTo(shared_from_this());
+  }
+}
+
 void FakeKCAppInstallCoordinator::reportChange() {
   if (auto s = service_.lock()) s->coordinatorChanged(shared_from_this());
 }

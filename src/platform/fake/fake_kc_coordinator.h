@@ -103,6 +103,9 @@ class FakeKCAppInstallCoordinator final
   bool forgetObserver(const KCAppInstallObserverDelegate* observer);
   // Asks the service to re-examine the coordinator.
   void reportChange();
+  // Loading saved state: takes `saved` as is, without its observer (observers are not state),
+  // and becomes the holder of its promises and placeholder.
+  void restore(Snapshot saved, bool placedPlaceholderRecord);
 
  private:
   // The scripted failure of `operation`, or the state error of an inactive coordinator.

@@ -119,6 +119,26 @@ void FakeKCDaemon::removeObserverEverywhere(const KCAppInstallObserverDelegate* 
   waitForRunningDelivery();
 }
 
+std::uint64_t FakeKCDaemon::upcomingPromiseIdentifier() const {
+  std::lock_guard lock(mutex_);
+  return nextPromiseIdentifier_;
+}
+
+void FakeKCDaemon::replaceState(std::vector<CoordinatorRef> coordinators,
+                                std::uint64_t nextPromiseIdentifier) {
+  {
+    std::lock_guard lock(mutex_);
+    coordinators_.clear();
+    std::erase_if(made_, [](const std::weak_ptr<Coordinator>& w) { return w.expired(); });
+    for (const CoordinatorRef& c : coordinators) {
+      coordinators_[c->bundleID()] = c;
+      made_.push_back(c);
+    }
+    nextPromiseIdentifier_ = nextPromiseIdentifier;
+  }
+  for (const CoordinatorRef& c : coordinators) c->reportChange();
+}
+
 FakeKCDaemon::CoordinatorRef FakeKCDaemon::makeLocked(KCCoordinatorKind kind,
                                                       const std::string& bundleID,
                                                       std::uint64_t creator) {

@@ -65,6 +65,13 @@ class FakeKCDaemon final : public FakeKCServiceHooks,
   void addRegistration(const FakeKCAppInstallObserver* registration);
   void removeObserverEverywhere(const KCAppInstallObserverDelegate* observer);
 
+  // --- Saved state ---
+  // The identifier the next promise will get.
+  std::uint64_t upcomingPromiseIdentifier() const;
+  // Replaces the coordinators and the next promise identifier with loaded ones, then has each
+  // re-examined: whatever was still to do when the state was saved gets done.
+  void replaceState(std::vector<CoordinatorRef> coordinators, std::uint64_t nextPromiseIdentifier);
+
   // --- The event thread ---
   void post(std::function<void()> work);
   void drain();

@@ -93,6 +93,20 @@ bool FakeKCPlaceholder::cancelOnce(const ErrorRef& reason) {
 
 void FakeKCPlaceholder::cancelByService(const ErrorRef& reason) { cancelOnce(reason); }
 
+void FakeKCPlaceholder::restoreConfiguration(std::shared_ptr<KCPromisedTransferToPath> iconPromise,
+                                             std::optional<KCPlaceholderAttributes> attributes,
+                                             std::shared_ptr<const EMStoreMetadata> metadata,
+                                             std::optional<plist::Bytes> sinf,
+                                             bool configurationComplete) {
+  state_.with([&](State& s) {
+    s.iconPromise = std::move(iconPromise);
+    s.attributes = std::move(attributes);
+    s.metadata = std::move(metadata);
+    s.sinf = std::move(sinf);
+    s.configurationComplete = configurationComplete;
+  });
+}
+
 bool FakeKCPlaceholder::cancelForReason(const ErrorRef& reason, std::uint64_t client,
                                         ErrorRef* error) {
   (void)client;

@@ -56,6 +56,11 @@ class FakeKCPlaceholder final : public KCPlaceholder {
   // Hands the placeholder to `coordinator`; false when it already belongs to one.
   bool handTo(const std::shared_ptr<FakeKCAppInstallCoordinator>& coordinator);
   void cancelByService(const ErrorRef& reason);
+  // Loading saved state: the configuration as it was, taken as is without counting a call.
+  void restoreConfiguration(std::shared_ptr<KCPromisedTransferToPath> iconPromise,
+                            std::optional<KCPlaceholderAttributes> attributes,
+                            std::shared_ptr<const EMStoreMetadata> metadata,
+                            std::optional<plist::Bytes> sinf, bool configurationComplete);
 
  private:
   struct State {
