@@ -9,6 +9,8 @@ namespace appsync::host {
 void addPlistCommands(CLI::App& app, int& status);
 void addIconCommand(CLI::App& app, int& status);
 void addDemoCommand(CLI::App& app, int& status);
+// `device init`.
+void addDeviceCommands(CLI::App& app, int& status);
 void addReplayCommand(CLI::App& app, int& status);
 
 }  // namespace appsync::host

@@ -131,8 +131,14 @@ DeviceSession::~DeviceSession() {
 }
 
 AppsClient& DeviceSession::client() {
+  std::lock_guard lock(clientMutex_);
   if (!client_) client_ = std::make_unique<AppsClient>(device_->platform());
   return *client_;
+}
+
+bool DeviceSession::hasClient() const {
+  std::lock_guard lock(clientMutex_);
+  return client_ != nullptr;
 }
 
 void DeviceSession::settle() {
@@ -148,7 +154,12 @@ void DeviceSession::close() {
   if (closed_) return;
   closed_ = true;
   settle();
-  client_.reset();
+  std::unique_ptr<AppsClient> client;
+  {
+    std::lock_guard lock(clientMutex_);
+    client = std::move(client_);
+  }
+  client.reset();
   settle();
   device_->saveState(stateDirectory(root_));
 }

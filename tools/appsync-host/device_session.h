@@ -41,8 +41,9 @@ class DeviceSession {
   ManualClock& clock() { return *device_->manualClock(); }
 
   // The client, created on first use as the host daemon creates it when it loads the plugin.
+  // Safe from any thread (a step in the background may be the first to ask).
   AppsClient& client();
-  bool hasClient() const { return client_ != nullptr; }
+  bool hasClient() const;
 
   // Lets every fake deliver what it holds (held events are released) and waits until no fake
   // has anything left to deliver.
@@ -65,7 +66,8 @@ class DeviceSession {
   std::filesystem::path root_;
   DeviceLock lock_;
   std::unique_ptr<FakePlatform> device_;
-  std::unique_ptr<AppsClient> client_;
+  mutable std::mutex clientMutex_;
+  std::unique_ptr<AppsClient> client_;  // guarded by clientMutex_
   bool closed_ = false;
   std::mutex producedMutex_;
   std::size_t logSeen_ = 0;

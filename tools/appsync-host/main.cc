@@ -3,6 +3,7 @@
 #include <CLI/CLI.hpp>
 
 #include "commands.h"
+#include "input_error.h"
 
 int main(int argc, char** argv) {
   CLI::App app{"appsync-host: drive the application-sync plugin against a simulated device"};
@@ -11,11 +12,14 @@ int main(int argc, char** argv) {
   appsync::host::addDemoCommand(app, status);
   appsync::host::addPlistCommands(app, status);
   appsync::host::addIconCommand(app, status);
+  appsync::host::addDeviceCommands(app, status);
   appsync::host::addReplayCommand(app, status);
   try {
     app.parse(argc, argv);
   } catch (const CLI::ParseError& e) {
-    return app.exit(e);
+    // Help is success; any other mistake on the command line is bad input.
+    const int printed = app.exit(e);
+    return printed == 0 ? 0 : appsync::host::kExitBadInput;
   }
   return status;
 }

@@ -4,6 +4,8 @@
 #include <cerrno>
 #include <cmath>
 #include <cstdlib>
+#include <cstring>
+#include <filesystem>
 #include <fstream>
 #include <limits>
 #include <sstream>
@@ -66,18 +68,29 @@ YamlField YamlField::loadText(std::string_view text, const std::string& name) {
   try {
     return YamlField(YAML::Load(std::string(text)), file, "");
   } catch (const YAML::Exception& e) {
-    throw InputError(name, e.mark.is_null() ? 0 : e.mark.line + 1, "",
-                     "not valid YAML: " + e.msg);
+    throw InputError(name, e.mark.is_null() ? 0 : e.mark.line + 1, "", "not valid YAML: " + e.msg);
   }
 }
 
 YamlField YamlField::loadFile(const std::string& path) {
+  std::error_code ec;
+  if (std::filesystem::is_directory(path, ec)) {
+    throw InputError(path, 0, "", "cannot read the file: it is a directory");
+  }
   std::ifstream in(path, std::ios::binary);
   if (!in) throw InputError(path, 0, "", "cannot read the file: " + std::string(strerror(errno)));
-  std::ostringstream text;
-  text << in.rdbuf();
+  // Read in pieces and stop past the limit: a file without end (a device, a pipe) must not fill
+  // the memory before the size is checked.
+  std::string text;
+  char piece[64 * 1024];
+  while (in.read(piece, sizeof piece) || in.gcount() > 0) {
+    text.append(piece, static_cast<std::size_t>(in.gcount()));
+    if (text.size() > kMaxYamlSize) {
+      throw InputError(path, 0, "", "larger than " + std::to_string(kMaxYamlSize) + " bytes");
+    }
+  }
   if (in.bad()) throw InputError(path, 0, "", "cannot read the file");
-  return loadText(text.str(), path);
+  return loadText(text, path);
 }
 
 YamlField::YamlField(YAML::Node node, std::shared_ptr<const std::string> file, std::string path)
@@ -136,6 +149,8 @@ std::vector<std::pair<std::string, YamlField>> YamlField::entries() const {
       child(entry.first, path_).fail("a key must be a plain text");
     }
     const std::string key = entry.first.Scalar();
+    if (!plist::text::isValidUtf8(key))
+      child(entry.first, path_).fail("the key is not valid UTF-8");
     out.emplace_back(key, child(entry.second, path_.empty() ? key : path_ + "." + key));
   }
   return out;
@@ -200,8 +215,7 @@ Duration YamlField::duration() const {
     std::string_view suffix;
     double nanoseconds;
   };
-  static constexpr Unit kUnits[] = {
-      {"ms", 1e6}, {"s", 1e9}, {"m", 60e9}, {"h", 3600e9}, {"", 1e9}};
+  static constexpr Unit kUnits[] = {{"ms", 1e6}, {"s", 1e9}, {"m", 60e9}, {"h", 3600e9}, {"", 1e9}};
   for (const Unit& unit : kUnits) {
     if (text.size() <= unit.suffix.size() || !text.ends_with(unit.suffix)) continue;
     auto number = parseReal(text.substr(0, text.size() - unit.suffix.size()));
@@ -237,7 +251,8 @@ struct PlistBuilder {
       return array;
     }
     if (!node.IsScalar()) {
-      field.fail("a property list has no null: write \"\" for an empty text, or leave the field out");
+      field.fail(
+          "a property list has no null: write \"\" for an empty text, or leave the field out");
     }
     return scalar(field, tag);
   }
@@ -260,12 +275,14 @@ struct PlistBuilder {
       return plist::Date{*seconds};
     }
     if (tag != "?") {
-      field.fail("unknown tag " + tag + " (use !string, !int, !uint, !real, !bool, !data or !date)");
+      field.fail("unknown tag " + tag +
+                 " (use !string, !int, !uint, !real, !bool, !data or !date)");
     }
     if (text == "true") return true;
     if (text == "false") return false;
     if (text == "~" || text == "null" || text.empty()) {
-      field.fail("a property list has no null: write \"\" for an empty text, or leave the field out");
+      field.fail(
+          "a property list has no null: write \"\" for an empty text, or leave the field out");
     }
     if (auto value = parseSigned(text)) return plist::Value(plist::Integer::fromSigned(*value));
     if (auto value = parseUnsigned(text)) return plist::Value(plist::Integer::fromUnsigned(*value));

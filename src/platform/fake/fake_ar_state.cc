@@ -67,10 +67,6 @@ FakeARWorkspace::AppRecord loadRecord(const StateFields& fields) {
           .lastInstallOptions = nullsRestored(fields.dictionary("lastInstallOptions"))};
 }
 
-plist::Array stringsState(const std::vector<std::string>& strings) {
-  return plist::Array(strings.begin(), strings.end());
-}
-
 }  // namespace
 
 plist::Dict FakeARWorkspace::saveState() const {

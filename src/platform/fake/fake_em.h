@@ -23,6 +23,11 @@ class FakeEMInstaller final : public EMInstaller, public FakeService {
   // The identifiers of each EmplaceClearUninstalled call, in call order.
   std::vector<std::vector<std::string>> clearCalls() const;
 
+  // The whole state as a property list, and back (replacing everything, with no events; a
+  // missing field is empty). loadState throws StateFormatError naming the bad field.
+  plist::Dict saveState() const;
+  void loadState(const StateFields& state);
+
   // A fresh dictionary identifier -> {} that the caller owns.
   std::unique_ptr<plist::Dict> EmplaceLookupUninstalled(const plist::Dict* options) override;
   // Forgets exactly the given identifiers (unknown ones are ignored).

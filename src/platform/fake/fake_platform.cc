@@ -15,7 +15,8 @@ std::unique_ptr<Clock> makeClock(bool manual) {
 FakePlatform::FakePlatform(std::filesystem::path root) : FakePlatform(std::move(root), Options{}) {}
 
 FakePlatform::FakePlatform(std::filesystem::path root, Options options)
-    : paths_(root),
+    : options_(options),
+      paths_(root),
       ownedClock_(makeClock(options.manualClock)),
       clock_(ownedClock_.get()),
       manualClock_(options.manualClock ? static_cast<ManualClock*>(ownedClock_.get()) : nullptr),

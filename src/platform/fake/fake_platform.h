@@ -18,6 +18,7 @@
 #include "platform/fake/fake_system.h"
 #include "platform/fake/fake_tr.h"
 #include "platform/fake/fake_transaction_log.h"
+#include "platform/fake/state_fields.h"
 #include "platform/icon/home_screen_icon_service.h"
 #include "platform/platform.h"
 
@@ -40,11 +41,16 @@ class FakePlatform {
   FakePlatform& operator=(const FakePlatform&) = delete;
 
   // The device's saved state: one property list per service in `directory` (the simulator's
-  // ROOT/.platform), XML. Saving twice with no change writes identical bytes. Throw
-  // StateFormatError ("FILE: field: problem") or std::runtime_error naming the file.
+  // ROOT/.platform), XML. Saving twice with no change writes identical bytes; a file whose
+  // bytes would not change is not rewritten. Throws StateFormatError ("FILE: field: problem")
+  // or a std::runtime_error naming the file that cannot be written or read. Load into a fresh
+  // platform made with loadOptions(directory): a service whose file is missing stays as the
+  // platform was made, empty. A load that throws may leave some services loaded: the platform
+  // is then to be discarded.
   void saveState(const std::filesystem::path& directory) const;
   void loadState(const std::filesystem::path& directory);
   // The options a device was created with, saved in `directory`/device.plist by saveState.
+  // manualClock is not saved: it keeps its default, and the caller chooses the clock.
   static Options loadOptions(const std::filesystem::path& directory);
 
   const Platform& platform() const { return platform_; }
@@ -68,6 +74,7 @@ class FakePlatform {
   FakeSystemServices& system() { return system_; }
 
  private:
+  const Options options_;
   Paths paths_;
   std::unique_ptr<Clock> ownedClock_;
   Clock* clock_;

@@ -51,6 +51,12 @@ class FakePVHomeScreen final : public PVHomeScreen, public FakeService {
   // Assertion requests made for `bundleID`.
   std::size_t assertionRequests(const std::string& bundleID) const;
 
+  // The whole state as a property list, and back (replacing everything, with no events; a
+  // missing field is empty). Buffers and assertions handed out are not state: they live in
+  // this process. loadState throws StateFormatError naming the bad field.
+  plist::Dict saveState() const;
+  void loadState(const StateFields& state);
+
   PVPort PVSPavilionBlockableServerPort() override;
   int PVSetIconState(PVPort port, const std::uint8_t* bytes, std::size_t length) override;
   int PVGetFlattenedIconState(PVPort port, int flags, PVBuffer* buffer,

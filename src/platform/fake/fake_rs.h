@@ -6,9 +6,12 @@
 #include <string>
 #include <string_view>
 
+#include "runtime/plist/value.h"
 #include "platform/rs.h"
 
 namespace appsync {
+
+class StateFields;
 
 // No operation fails; a setting without a value answers RSRestrictedBoolNoData.
 class FakeRSProfileConnection final : public RSProfileConnection {
@@ -17,6 +20,11 @@ class FakeRSProfileConnection final : public RSProfileConnection {
     std::lock_guard lock(mutex_);
     values_[std::string(setting)] = value;
   }
+  // The setting values as a property list, and back (replacing them; a missing field is
+  // empty). loadState throws StateFormatError naming the bad field.
+  plist::Dict saveState() const;
+  void loadState(const StateFields& state);
+
   int effectiveBoolValueForSetting(std::string_view setting) override {
     std::lock_guard lock(mutex_);
     auto it = values_.find(setting);
@@ -24,7 +32,7 @@ class FakeRSProfileConnection final : public RSProfileConnection {
   }
 
  private:
-  std::mutex mutex_;
+  mutable std::mutex mutex_;
   std::map<std::string, int, std::less<>> values_;
 };
 

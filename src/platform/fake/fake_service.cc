@@ -59,6 +59,21 @@ std::size_t FakeService::callCount(std::string_view operation) const {
   return it->second.calls;
 }
 
+bool FakeService::knowsOperation(std::string_view operation) const {
+  std::lock_guard lock(mutex_);
+  auto it = scripts_.find(operation);
+  return it != scripts_.end() && it->second.canFail;
+}
+
+std::vector<std::string> FakeService::operationNames() const {
+  std::lock_guard lock(mutex_);
+  std::vector<std::string> names;
+  for (const auto& [name, script] : scripts_) {
+    if (script.canFail) names.push_back(name);
+  }
+  return names;  // the map keeps them sorted
+}
+
 ErrorRef FakeService::beginCall(std::string_view operation) {
   std::lock_guard lock(mutex_);
   Script& script = scriptFor(operation, false);

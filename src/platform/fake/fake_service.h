@@ -8,10 +8,14 @@
 #include <mutex>
 #include <string>
 #include <string_view>
+#include <vector>
 
 #include "runtime/error.h"
+#include "runtime/plist/value.h"
 
 namespace appsync {
+
+class StateFields;
 
 // Operations are named as the platform names them: the selector for methods
 // ("installApplication:withOptions:error:"), the function name for functions
@@ -31,6 +35,20 @@ class FakeService {
   std::size_t callCount(std::string_view operation) const;
 
   const std::string& serviceName() const { return serviceName_; }
+
+  // The scripts as saved state: operation name -> {"calls", "failing"?: {"error", "times"?}}
+  // ("times" absent: every call fails), for every operation called or failing. loadScripts
+  // replaces every count and script; an operation the state does not name has no calls and
+  // succeeds. Throws StateFormatError for an operation this service does not have, or a failure
+  // of one that cannot fail.
+  plist::Dict saveScripts() const;
+  void loadScripts(const StateFields& scripts);
+
+  // Whether failOperation and succeedOperation take `operation`: the service has it and it can
+  // fail. Lets a caller with names from outside (a script) refuse a bad one instead of aborting.
+  bool knowsOperation(std::string_view operation) const;
+  // The operations failOperation takes, sorted.
+  std::vector<std::string> operationNames() const;
 
  protected:
   struct OperationSpec {

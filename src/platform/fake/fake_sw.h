@@ -27,6 +27,11 @@ class FakeSWBackupService final : public SWBackupService, public FakeService {
   // Identifiers passed to cancelApplicationRestoreWithBundleID (successful or not), in order.
   std::vector<std::string> cancelledRestores() const;
 
+  // The whole state as a property list, and back (replacing everything, with no events; a
+  // missing field is empty). loadState throws StateFormatError naming the bad field.
+  plist::Dict saveState() const;
+  void loadState(const StateFields& state);
+
   std::shared_ptr<SWManager> newManager() override;
 
  private:

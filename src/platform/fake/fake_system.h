@@ -64,6 +64,14 @@ class FakeSystemServices final : public SystemServices, public FakeService {
 
   void setMainBundleIdentifier(std::string identifier);
 
+  // The named notifications (states, tokens, posts), ownerships and the main bundle identifier
+  // as a property list, and back, replacing them with no events. Observer registrations are not
+  // state: they live in this process and are kept. A missing field is empty, but a missing main
+  // bundle identifier leaves the current one. loadState throws StateFormatError naming the bad
+  // field.
+  plist::Dict saveState() const;
+  void loadState(const StateFields& state);
+
   // ---- SystemServices ----
 
   std::uint32_t notifyRegisterCheck(const std::string& name, int* token) override;

@@ -38,6 +38,12 @@ class FakeTRDeviceService final : public TRDeviceService, public FakeService {
   std::vector<std::string> prioritizedIdentifiers() const;
   std::vector<std::string> cancelledIdentifiers() const;
 
+  // The identifiers and what the host offers, as a property list, and back (replacing them, with
+  // no events; a missing field is empty, a missing switch is offered). Completions are not
+  // state. loadState throws StateFormatError naming the bad field.
+  plist::Dict saveState() const;
+  void loadState(const StateFields& state);
+
   // Waits until every completion handed out so far has run.
   void drain() { callbacks_.drain(); }
   // Hold and release the completions.
@@ -67,6 +73,7 @@ class FakeTRHost final : public TRHostFramework {
   static bool defaultIsRecoverable(const ErrorRef& error);
 
   FakeTRDeviceService& deviceService() { return *deviceService_; }
+  const FakeTRDeviceService& deviceService() const { return *deviceService_; }
 
   LogCategory& TRGetLogCategory(int category) override;
   bool TRIsRecoverableError(const ErrorRef& error) override;

@@ -8,9 +8,12 @@
 #include <string>
 #include <vector>
 
+#include "runtime/plist/value.h"
 #include "platform/transaction_log.h"
 
 namespace appsync {
+
+class StateFields;
 
 struct TransactionLogEntry {
   enum class Kind { Step, Scenario };
@@ -39,6 +42,11 @@ class FakeTransactionLog final : public AITransactionLog {
   std::vector<TransactionLogEntry> steps() const;
   std::vector<TransactionLogEntry> scenarios() const;
   void clear();
+  // Every entry as a property list, and back (replacing the entries without calling the
+  // listener; the objects passed to initializeWithLog are not state). loadState throws
+  // StateFormatError naming the bad field.
+  plist::Dict saveState() const;
+  void loadState(const StateFields& state);
   // Called with each new entry, in the order they are kept (the simulator writes its file so).
   // The listener must not log to this transaction log.
   void setEntryListener(std::function<void(const TransactionLogEntry&)> listener);

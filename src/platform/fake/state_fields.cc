@@ -1,6 +1,7 @@
 // Typed reading of saved fake state, with messages that name the field.
 #include "platform/fake/state_fields.h"
 
+#include <cstdint>
 #include <utility>
 
 namespace appsync {
@@ -53,6 +54,19 @@ std::int64_t StateFields::integer(std::string_view key) const {
 std::optional<std::int64_t> StateFields::optionalInteger(std::string_view key) const {
   if (!has(key)) return std::nullopt;
   return integer(key);
+}
+
+std::int32_t StateFields::int32(std::string_view key) const {
+  auto value = required(key).int64();
+  if (!value || required(key).integer() == nullptr || *value < INT32_MIN || *value > INT32_MAX) {
+    fail(key, "expected a 32-bit integer");
+  }
+  return static_cast<std::int32_t>(*value);
+}
+
+std::optional<std::int32_t> StateFields::optionalInt32(std::string_view key) const {
+  if (!has(key)) return std::nullopt;
+  return int32(key);
 }
 
 double StateFields::real(std::string_view key) const {
@@ -129,6 +143,19 @@ std::vector<std::string> StateFields::strings(std::string_view key) const {
   return out;
 }
 
+std::vector<std::int32_t> StateFields::int32s(std::string_view key) const {
+  std::vector<std::int32_t> out;
+  const plist::Array items = array(key);
+  for (std::size_t i = 0; i < items.size(); ++i) {
+    auto value = items[i].int64();
+    if (!value || items[i].integer() == nullptr || *value < INT32_MIN || *value > INT32_MAX) {
+      throw StateFormatError(path(key) + "[" + std::to_string(i) + "]: expected a 32-bit integer");
+    }
+    out.push_back(static_cast<std::int32_t>(*value));
+  }
+  return out;
+}
+
 ErrorRef StateFields::error(std::string_view key) const {
   StateFields fields = child(key);
   auto error = std::make_shared<Error>();
@@ -142,6 +169,10 @@ ErrorRef StateFields::error(std::string_view key) const {
 ErrorRef StateFields::optionalError(std::string_view key) const {
   if (!has(key)) return nullptr;
   return error(key);
+}
+
+plist::Array stringsState(const std::vector<std::string>& strings) {
+  return plist::Array(strings.begin(), strings.end());
 }
 
 plist::Dict errorState(const Error& error) {

@@ -37,6 +37,9 @@ class StateFields {
   std::optional<std::uint64_t> optionalUnsigned(std::string_view key) const;
   std::int64_t integer(std::string_view key) const;
   std::optional<std::int64_t> optionalInteger(std::string_view key) const;
+  // An integer that fits 32 bits (statuses, codes, setting values).
+  std::int32_t int32(std::string_view key) const;
+  std::optional<std::int32_t> optionalInt32(std::string_view key) const;
   double real(std::string_view key) const;
   // A missing boolean is `fallback`.
   bool boolean(std::string_view key, bool fallback) const;
@@ -52,6 +55,8 @@ class StateFields {
   std::vector<StateFields> records(std::string_view key) const;
   // An array of strings. Missing: none.
   std::vector<std::string> strings(std::string_view key) const;
+  // An array of 32-bit integers. Missing: none.
+  std::vector<std::int32_t> int32s(std::string_view key) const;
 
   // An error saved by errorState (domain, code, userInfo, underlying).
   ErrorRef error(std::string_view key) const;
@@ -63,6 +68,9 @@ class StateFields {
   plist::Dict dict_;
   std::string where_;
 };
+
+// Strings as saved state: an array of them, in order.
+plist::Array stringsState(const std::vector<std::string>& strings);
 
 // An error as saved state: {"domain", "code", "userInfo"?, "underlying"?}.
 plist::Dict errorState(const Error& error);

@@ -1,0 +1,302 @@
+// Devices made from descriptions: each application recorded as a real install records it, the
+// device-wide facts where the plugin reads them, bad descriptions refused where they are wrong,
+// and `device init` as a command.
+#include "device_description.h"
+
+#include <gtest/gtest.h>
+#include <zip.h>
+
+#include <algorithm>
+#include <cstdlib>
+#include <filesystem>
+#include <map>
+#include <string>
+
+#include "bundle_maker.h"
+#include "device_files.h"
+#include "platform/ar.h"
+#include "platform/bundle_keys.h"
+#include "platform/fake/fake_ar_bundle_files.h"
+#include "platform/icon/home_screen_icon_service.h"
+#include "platform/rs.h"
+#include "runtime/fs/files.h"
+#include "runtime/plist/codec.h"
+#include "support/host_process.h"
+#include "support/temp_dir.h"
+#include "support/text_file.h"
+
+namespace appsync::host {
+namespace {
+
+namespace fs = std::filesystem;
+using AppRecord = FakeARWorkspace::AppRecord;
+
+constexpr std::string_view kDescription = R"(road: coordination
+insideHostDaemon: true
+apps:
+  - identifier: com.a.notes
+    name: Notes
+    version: 1.0
+    installType: storeDownload
+    hasMIDBasedSINF: true
+    restoreData: 4096
+    storeMetadata: {vantorId: a@example.com, is-auto-download: true}
+  - identifier: com.a.clock
+    name: Clock
+    type: system
+    diskUsage: 777
+  - identifier: com.a.later
+    placeholder: true
+    installType: 2
+  - identifier: com.a.settings
+    type: system
+    placeholder: true
+restrictions: {allowAppRemoval: false}
+iconOrder: [com.a.clock, com.a.gone]
+demotedApps: {AutomaticDowngrades: [com.a.later]}
+lastSync: [com.a.notes, com.a.old]
+uninstalled: [com.a.old]
+)";
+
+std::optional<plist::Value> readPlist(const fs::path& path) {
+  auto bytes = readFile(path.string());
+  return bytes ? plist::parse(*bytes) : std::nullopt;
+}
+
+// The record with its paths made relative to `root`, and without the options of the install
+// that made it (a described application had none).
+AppRecord relative(AppRecord record, const fs::path& root) {
+  for (auto* path : {&record.bundleDirectory, &record.containerDirectory, &record.iconPath}) {
+    if (*path) *path = fs::path(**path).lexically_relative(root).generic_string();
+  }
+  record.lastInstallOptions = {};
+  return record;
+}
+
+std::string show(const AppRecord& r) {
+  const auto text = [](const std::optional<std::string>& s) { return s.value_or("-"); };
+  return r.identifier + " " + r.applicationType + " " + text(r.version) + " " + text(r.name) +
+         " type " + std::to_string(r.installType) + (r.isPlaceholder ? " placeholder " : " ") +
+         text(r.bundleDirectory) + " in " + text(r.containerDirectory) + " icon " +
+         text(r.iconPath) + " disk " +
+         (r.staticDiskUsage ? std::to_string(*r.staticDiskUsage) : "-") +
+         (r.hasMIDBasedSINF ? " sinf" : "");
+}
+
+TEST(DeviceDescriptionTest, EverythingDescribedIsWhereThePluginReadsIt) {
+  testing::TempDir root;
+  const YamlField description = YamlField::loadText(kDescription, "d.yaml");
+  const FakePlatform::Options options = deviceOptions(&description);
+  EXPECT_TRUE(options.coordination);
+  auto session = DeviceSession::create(root.path(), options);
+  applyDescription(*session, &description);
+  FakePlatform& device = session->device();
+
+  // The same Notes installed as a package on another device: the described one must not differ.
+  testing::TempDir other;
+  FakeARWorkspace installer(other.path());
+  const fs::path package =
+      makeBundle(other.path(), other.path() / "in",
+                 {.identifier = "com.a.notes", .name = "Notes", .version = "1.0"});
+  plist::Dict install;
+  install.set(std::string(kBNBundleIdentifierKey), "com.a.notes");
+  install.set(std::string(ARInstallTypeKey), plist::Integer::fromUnsigned(1));
+  ASSERT_TRUE(installer.installApplication(package.string(), install, nullptr));
+  AppRecord installedNotes = relative(*installer.application("com.a.notes"), other.path());
+  installedNotes.hasMIDBasedSINF = true;
+
+  const std::string at = "private/var/containers/Bundle/Application/";
+  const std::vector<std::string> expected = {
+      show(installedNotes),
+      "com.a.clock System 1.0 Clock type 0 " + at + "com.a.clock/Clock.app in " + at +
+          "com.a.clock icon " + at + "com.a.clock/Clock.app/Icon.png disk 777",
+      "com.a.later User 1.0 later type 2 placeholder " + at + "com.a.later/later.app in - icon " +
+          at + "com.a.later/later.app/Icon.png disk -",
+      "com.a.settings System 1.0 settings type 0 placeholder " + at +
+          "com.a.settings/settings.app in - icon " + at +
+          "com.a.settings/settings.app/Icon.png disk -",
+  };
+  std::vector<std::string> records;
+  for (const AppRecord& app : device.ar().applications())
+    records.push_back(show(relative(app, root.path())));
+  EXPECT_EQ(records, expected);
+  EXPECT_FALSE(device.ar().applicationProxyForIdentifier("com.a.later", false));
+
+  // Store metadata beside the bundle; the rest where each service keeps it.
+  const auto metadata = readPlist(root.path() / at / "com.a.notes" / "CaravelMetadata.plist");
+  ASSERT_TRUE(metadata && metadata->dict());
+  EXPECT_EQ(*plist::stringAt(*metadata->dict(), "vantorId"), "a@example.com");
+  EXPECT_FALSE(fs::exists(root.path() / at / "com.a.clock" / "CaravelMetadata.plist"));
+  EXPECT_EQ(device.system().mainBundleIdentifier(), "com.vantor.trc");
+  EXPECT_EQ(device.rs().effectiveBoolValueForSetting(RSFeatureAppRemovalAllowed),
+            RSRestrictedBoolExplicitNo);
+  std::uint64_t size = 0;
+  EXPECT_TRUE(
+      device.sw().newManager()->restoreDataExistsForApplicationWithBundleID("com.a.notes", &size));
+  EXPECT_EQ(size, 4096u);
+  PVBuffer buffer;
+  std::uint32_t length = 0;
+  device.pv().PVGetFlattenedIconState(device.pv().PVSPavilionBlockableServerPort(), 0, &buffer,
+                                      &length);
+  ASSERT_TRUE(buffer);
+  EXPECT_EQ(plist::parse(plist::Bytes(buffer.get(), buffer.get() + length)),
+            plist::Value(plist::Array{"com.a.clock", "com.a.gone"}));
+  plist::Dict demoted;
+  demoted.set("AutomaticDowngrades", plist::Array{"com.a.later"});
+  EXPECT_EQ(readPlist(session->paths().demotedApps()), plist::Value(demoted));
+  EXPECT_EQ(readPlist(session->paths().lastSyncAppState()),
+            plist::Value(plist::Array{"com.a.notes", "com.a.old"}));
+  EXPECT_EQ(device.em().uninstalled(), std::vector<std::string>{"com.a.old"});
+}
+
+TEST(DeviceDescriptionErrorsTest, BadDescriptionsNameTheLineAndTheField) {
+  struct Row {
+    std::string document;
+    std::string error;
+  };
+  const Row rows[] = {
+      {"road: legacy\nhomeScreen: []\n", "d.yaml:2: homeScreen: unknown field \"homeScreen\""},
+      {"insideHostDaemon: 1\n", "d.yaml:1: insideHostDaemon: expected true or false"},
+      {"apps:\n  - name: A\n", "d.yaml:2: apps[0]: the field \"identifier\" is missing"},
+      {"apps:\n  - identifier: com.a\n    verison: 2\n",
+       "d.yaml:3: apps[0].verison: unknown field \"verison\""},
+      {"apps:\n  - identifier: com.a\n  - identifier: com.b\n  - identifier: com.a\n",
+       "d.yaml:4: apps[2].identifier: \"com.a\" is described twice"},
+      {"apps:\n  - identifier: ../../etc\n", "d.yaml:2: apps[0].identifier: \"../../etc\" cannot"},
+      {"apps:\n  - identifier: com.a\n    name: ../A\n", "d.yaml:3: apps[0].name: \"../A\" cannot"},
+      {"apps:\n  - identifier: com.a\n    type: admin\n",
+       "d.yaml:3: apps[0].type: expected user or system"},
+      {"apps:\n  - identifier: com.a\n    installType: bought\n",
+       "d.yaml:3: apps[0].installType: expected a number or one of"},
+      {"apps:\n  - identifier: com.a\n    storeMetadata: ~\n",
+       "d.yaml:3: apps[0].storeMetadata: a property list has no null"},
+      {"restrictions: {allowEverything: true}\n",
+       "d.yaml:1: restrictions.allowEverything: unknown field"},
+      {"lastSync: [a, ~]\n", "d.yaml:1: lastSync[1]: a property list has no null"},
+      {"- road: legacy\n", "d.yaml:1: a device description is a mapping"},
+  };
+  for (const Row& row : rows) {
+    std::string error;
+    try {
+      const YamlField description = YamlField::loadText(row.document, "d.yaml");
+      // Reading the options reads everything: bad input is found before a device exists.
+      deviceOptions(&description);
+    } catch (const InputError& e) {
+      error = e.what();
+    }
+    EXPECT_EQ(error.rfind(row.error, 0), 0u) << row.document << "\n  error: " << error;
+  }
+}
+
+TEST(BundleMakerTest, BundlesRenderPackAndStayUnderTheRoot) {
+  testing::TempDir root;
+  const BundleSpec spec{.identifier = "com.a.notes", .name = "Notes", .version = "3"};
+  const fs::path bundle = makeBundle(root.path(), root.path() / "b", spec);
+  EXPECT_EQ(bundle, root.path() / "b" / "Notes.app");
+  std::string why;
+  EXPECT_TRUE(renderIconPng(bundle.string(), 57, &why)) << why;
+
+  // Packed: the folder at the top of the archive, every file as it is.
+  makeDeviceDirectory(root.path(), bundle / "Sub");
+  testing::writeText(bundle / "Sub" / "data.txt", "payload");
+  const fs::path zipPath = root.path() / "staging" / "Notes.zip";
+  zipBundle(root.path(), bundle, zipPath);
+  int status = 0;
+  zip_t* archive = zip_open(zipPath.c_str(), ZIP_RDONLY, &status);
+  ASSERT_TRUE(archive) << status;
+  std::map<std::string, std::string> entries;
+  for (zip_int64_t i = 0; i < zip_get_num_entries(archive, 0); ++i) {
+    zip_stat_t stat;
+    zip_stat_index(archive, i, 0, &stat);
+    std::string bytes(stat.size, '\0');
+    zip_file_t* file = zip_fopen_index(archive, i, 0);
+    ASSERT_TRUE(file);
+    EXPECT_EQ(zip_fread(file, bytes.data(), bytes.size()), static_cast<zip_int64_t>(stat.size));
+    zip_fclose(file);
+    entries[stat.name] = bytes;
+  }
+  zip_close(archive);
+  EXPECT_EQ(entries.size(), 5u);  // Notes.app/, Info.plist, Icon.png, Sub/, Sub/data.txt
+  EXPECT_EQ(entries["Notes.app/Sub/data.txt"], "payload");
+  EXPECT_EQ(entries["Notes.app/Icon.png"], testing::readText(bundle / "Icon.png"));
+  EXPECT_EQ(entries["Notes.app/Info.plist"], testing::readText(bundle / "Info.plist"));
+
+  // Nothing outside the root, and no link packed or written through.
+  testing::TempDir outside;
+  EXPECT_THROW(makeBundle(root.path(), root.path() / ".." / "x", spec), std::runtime_error);
+  EXPECT_THROW(makeBundle(root.path(), root.path() / "b",
+                          {.identifier = "x", .name = "../x", .version = "1"}),
+               std::runtime_error);
+  fs::create_directory_symlink(outside.path(), root.path() / "link");
+  EXPECT_THROW(makeBundle(root.path(), root.path() / "link", spec), std::runtime_error);
+  EXPECT_TRUE(fs::is_empty(outside.path()));
+  fs::create_symlink(outside.path(), bundle / "escape");
+  EXPECT_THROW(zipBundle(root.path(), bundle, root.path() / "Again.zip"), std::runtime_error);
+  EXPECT_FALSE(fs::exists(root.path() / "Again.zip"));
+}
+
+// The records of a device, paths relative to its root, one line each in the registry's order.
+std::vector<std::string> recordsOf(DeviceSession& session) {
+  std::vector<std::string> out;
+  for (const AppRecord& app : session.device().ar().applications()) {
+    out.push_back(show(relative(app, session.root())));
+  }
+  return out;
+}
+
+TEST(DeviceInitCommandTest, MakesSavesAndRefusesDevices) {
+  const char* host = std::getenv("APPSYNC_HOST");
+  const char* source = std::getenv("APPSYNC_SOURCE_DIR");
+  ASSERT_TRUE(host && source) << "APPSYNC_HOST and APPSYNC_SOURCE_DIR are set by the build";
+  const fs::path examples = fs::path(source) / "tests" / "scenarios" / "devices";
+  testing::TempDir dir;
+  const auto init = [&](const std::string& root, const std::string& from) {
+    return testing::runHost(host,
+                            "device init --root '" + (dir / root) + "'" +
+                                (from.empty() ? "" : " --from '" + from + "'"),
+                            dir.path());
+  };
+
+  // Each example as a command makes it: one line per app and a summary, and a later command
+  // loads the same records the description gives.
+  for (const std::string name : {"default.yaml", "coordinated-daemon.yaml", "legacy-road.yaml"}) {
+    const testing::HostRun made = init(name, (examples / name).string());
+    ASSERT_EQ(made.status, 0) << name << ": " << made.stderrText;
+    const YamlField description = YamlField::loadFile((examples / name).string());
+    testing::TempDir direct;
+    auto expected = DeviceSession::create(direct.path(), deviceOptions(&description));
+    applyDescription(*expected, &description);
+    const auto loaded = DeviceSession::open(dir / name);
+    EXPECT_EQ(recordsOf(*loaded), recordsOf(*expected)) << name;
+    EXPECT_EQ(std::count(made.stdoutText.begin(), made.stdoutText.end(), '\n'),
+              static_cast<long>(recordsOf(*expected).size()) + 1)
+        << made.stdoutText;
+  }
+  // Without a description: the default device, as default.yaml writes it out.
+  ASSERT_EQ(init("plain", "").status, 0);
+  EXPECT_EQ(recordsOf(*DeviceSession::open(dir / "plain")),
+            recordsOf(*DeviceSession::open(dir / "default.yaml")));
+
+  // A described app's icon renders from its bundle on the device.
+  const testing::HostRun icon = testing::runHost(
+      host,
+      "icon '" +
+          (dir / "plain/private/var/containers/Bundle/Application/com.example.notes/Notes.app") +
+          "' -o '" + (dir / "notes.png") + "'",
+      dir.path());
+  EXPECT_EQ(icon.status, 0) << icon.stderrText;
+
+  // A root that holds a device is refused and left alone; bad input makes no device.
+  const testing::HostRun again = init("plain", "");
+  EXPECT_EQ(again.status, 2);
+  EXPECT_NE(again.stderrText.find("already holds a device"), std::string::npos) << again.stderrText;
+  testing::writeText(dir.path() / "bad.yaml", "apps:\n  - identifier: com.a\n    tpye: system\n");
+  const testing::HostRun bad = init("badroot", dir / "bad.yaml");
+  EXPECT_EQ(bad.status, 2);
+  EXPECT_NE(bad.stderrText.find("bad.yaml:3: apps[0].tpye: unknown field"), std::string::npos)
+      << bad.stderrText;
+  EXPECT_FALSE(fs::exists(dir.path() / "badroot"));
+}
+
+}  // namespace
+}  // namespace appsync::host

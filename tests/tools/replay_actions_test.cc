@@ -1,0 +1,316 @@
+// The actions of replay scripts, run through runAction on a device in a temporary directory.
+#include <gtest/gtest.h>
+#include <zip.h>
+
+#include <filesystem>
+#include <memory>
+#include <string>
+#include <vector>
+
+#include "client/apps_client.h"
+#include "device_session.h"
+#include "input_error.h"
+#include "platform/fake/fake_kc_objects.h"
+#include "platform/icon/png_codec.h"
+#include "platform/tr_client.h"
+#include "replay/step_context.h"
+#include "runtime/fs/files.h"
+#include "runtime/plist/codec.h"
+#include "state/loaders.h"
+#include "support/temp_dir.h"
+#include "yaml_input.h"
+
+namespace appsync::host::replay {
+namespace {
+
+namespace fs = std::filesystem;
+
+class ReplayActionsTest : public ::testing::Test {
+ protected:
+  void SetUp() override { session_ = DeviceSession::create(dir_.path() / "device", {}); }
+
+  // Runs the one step that `yaml` is (a flow mapping such as "{stage: todo, list: []}") as the
+  // engine does: read from a script, selector and value picked out of the step.
+  ActionResult run(const std::string& yaml) {
+    YamlField script = YamlField::loadText("steps:\n  - " + yaml + "\n", "script.yaml");
+    YamlField step = script["steps"].items().at(0);
+    std::string selector;
+    for (const auto& [key, value] : step.entries()) {
+      for (std::string_view known : kActionSelectors) selector = key == known ? key : selector;
+    }
+    YamlField value = step[selector];
+    StepContext context{*session_, step, selector, value, dir_.path()};
+    return runAction(context);
+  }
+
+  const fs::path& root() const { return session_->root(); }
+
+  testing::TempDir dir_;
+  std::unique_ptr<DeviceSession> session_;
+};
+
+TEST_F(ReplayActionsTest, BadArgumentsAreInputErrorsNamingTheField) {
+  struct Case {
+    std::string step;
+    std::string field;    // the field the error names
+    std::string message;  // part of the message
+  };
+  const std::vector<Case> cases = {
+      {"{call: frobnicate}", "steps[0].call",
+       "reconcileSync:withNewAnchor:progressCallback:error:"},
+      {"{call: 'syncEndedWithSuccess:', success: maybe}", "steps[0].success", "true or false"},
+      {"{call: 'syncEndedWithSuccess:'}", "steps[0]", "success"},
+      {"{call: 'reconcileSync:withNewAnchor:progressCallback:error:', syncType: 4294967296, "
+       "newAnchor: a}",
+       "steps[0].syncType", "4294967295"},
+      {"{call: 'assetInstallSucceeded:', asset: {identifier: a, downloadProgress: fast}}",
+       "steps[0].asset.downloadProgress", "number"},
+      {"{call: 'assetInstallFailed:withError:', asset: {identifier: a}, error: {domain: D}}",
+       "steps[0].error", "code"},
+      {"{plugin: changeAssetID, app: a, stat: X}", "steps[0].stat", "unknown field"},
+      {"{plugin: orderTheItems, apps: 3}", "steps[0].apps", "list"},
+      {"{event: hold, service: kitchen}", "steps[0].service", "notifications"},
+      {"{event: promise-began, app: a, promise: tomorrow}", "steps[0].promise", "user-data"},
+      {"{platform: fail, service: registry, operation: 'nope:'}", "steps[0].operation",
+       "installApplication:withOptions:error:"},
+      {"{platform: fail, service: registry, operation: 'addObserver:'}", "steps[0].operation",
+       "can fail"},
+      {"{platform: fail, service: registry, operation: 'applicationIsInstalled:', times: 0}",
+       "steps[0].times", "from 1"},
+      {"{platform: restrict, setting: allowAppInstallation, value: maybe}", "steps[0].value",
+       "true or false"},
+      {"{platform: restrict, setting: allowEverything, value: true}", "steps[0].setting",
+       "allowAppRemoval"},
+      {"{stage: todo, list: {a: 1}}", "steps[0].list", "list"},
+      {"{stage: package, identifier: com.a, name: A, file: A}", "steps[0].file", "NAME.zip"},
+      {"{stage: package, identifier: com.a, name: A, as: zip, file: A.app}", "steps[0].file",
+       "zip"},
+      {"{stage: file, path: a.txt}", "steps[0].stage", "exactly one"},
+      {"{stage: icon-layout, layout: [a], note: fine, extra: 1}", "steps[0].extra",
+       "unknown field"},
+  };
+  for (const Case& c : cases) {
+    SCOPED_TRACE(c.step);
+    try {
+      run(c.step);
+      ADD_FAILURE() << "no error";
+    } catch (const InputError& e) {
+      EXPECT_EQ(e.file(), "script.yaml");
+      EXPECT_EQ(e.line(), 2);
+      EXPECT_EQ(e.field(), c.field) << e.what();
+      EXPECT_NE(std::string(e.what()).find(c.message), std::string::npos) << e.what();
+    }
+  }
+}
+
+// Every operation of the protocol has its entry; one the client does not implement answers
+// "not implemented" instead of being called (which would abort this test).
+TEST_F(ReplayActionsTest, HostOperationsTheClientLacksAnswerNotImplemented) {
+  const std::string asset =
+      "asset: {identifier: com.a, path: var/mobile/Media/PublicStaging/A.zip}";
+  const std::vector<std::pair<TRClientOperation, std::string>> arguments = {
+      {TRClientOperation::prepareForSyncWithHostAnchor, "hostAnchor: h"},
+      {TRClientOperation::prepareForSyncWithHostAnchorHostAuthIdentifierHostVersion,
+       "hostAnchor: h, hostAuthIdentifier: 7, hostVersion: '12.1'"},
+      {TRClientOperation::reconcileSync, "syncType: 1, newAnchor: n"},
+      {TRClientOperation::syncEndedWithSuccess, "success: true"},
+      {TRClientOperation::reconcileRestoreOfType, "restoreType: 2"},
+      {TRClientOperation::restoreEndedWithError, "error: {domain: TRError, code: 30}"},
+      {TRClientOperation::assetTransferSucceeded, asset + ", succeeded: false"},
+      {TRClientOperation::assetTransferUpdatedProgress, asset + ", progress: 0.5"},
+      {TRClientOperation::assetTransferEndedWithSuccess, "success: true"},
+      {TRClientOperation::assetInstallSucceeded, asset},
+      {TRClientOperation::assetInstallFailed, asset + ", error: {domain: E, code: 1}"},
+      {TRClientOperation::metadataUpdate, asset + ", metadata: {k: v}, newAnchor: n"},
+      {TRClientOperation::prioritizeAsset, asset},
+      {TRClientOperation::shouldRestoreFile, "path: var/mobile/Library/x"},
+      {TRClientOperation::shouldBackgroundRestorePath, "path: var/mobile/Library/x"},
+      {TRClientOperation::shouldBackgroundRestoreFile, "path: var/mobile/Library/x"},
+  };
+  int checked = 0;
+  for (int i = 0; i <= static_cast<int>(TRClientOperation::shouldBackgroundRestoreFile); ++i) {
+    const auto operation = static_cast<TRClientOperation>(i);
+    if (session_->client().respondsTo(operation)) continue;  // implemented: nothing to show here
+    std::string fields;
+    for (const auto& [op, text] : arguments) fields = op == operation ? ", " + text : fields;
+    SCOPED_TRACE(operationName(operation));
+    const ActionResult result =
+        run(std::string("{call: '") + operationName(operation) + "'" + fields + "}");
+    EXPECT_EQ(result, plist::Value("not implemented"));
+    ++checked;
+  }
+  EXPECT_GT(checked, 0);
+  EXPECT_EQ(run("{call: supportedDataclasses}"), plist::Value(plist::Array{"Application"}));
+}
+
+TEST_F(ReplayActionsTest, StagedTodoListIsBinaryAndTheLoaderReadsIt) {
+  run("{stage: todo, list: [{identifier: com.a, operation: install, version: '1.0', name: A}]}");
+  const std::string path = session_->paths().todoList();
+  plist::Format format;
+  ASSERT_TRUE(plist::parse(readFile(path).value_or(plist::Bytes{}), nullptr, &format));
+  EXPECT_EQ(format, plist::Format::Binary);
+  const auto list = loadTodoList(session_->device().tr(), path, nullptr);
+  const plist::Array expected{plist::Dict{
+      {"identifier", "com.a"}, {"operation", "install"}, {"version", "1.0"}, {"name", "A"}}};
+  EXPECT_EQ(list, expected);
+}
+
+TEST_F(ReplayActionsTest, StagedPackagesAreBundleFoldersOrZipsHoldingThem) {
+  EXPECT_EQ(run("{stage: package, identifier: com.a, name: Notes}"),
+            plist::Value("var/mobile/Media/PublicStaging/Notes.app"));
+  const auto info = plist::parse(
+      readFile((root() / "var/mobile/Media/PublicStaging/Notes.app/Info.plist").string())
+          .value_or(plist::Bytes{}));
+  ASSERT_TRUE(info && info->dict());
+  EXPECT_EQ(*info->dict()->find("BNBundleIdentifier"), plist::Value("com.a"));
+
+  EXPECT_EQ(run("{stage: package, identifier: com.b, name: Maps, as: zip, file: in/Other.zip}"),
+            plist::Value("var/mobile/Media/PublicStaging/in/Other.zip"));
+  const std::string zipPath = (root() / "var/mobile/Media/PublicStaging/in/Other.zip").string();
+  int error = 0;
+  zip_t* archive = zip_open(zipPath.c_str(), ZIP_RDONLY | ZIP_CHECKCONS, &error);
+  ASSERT_NE(archive, nullptr) << "zip error " << error;
+  EXPECT_GE(zip_name_locate(archive, "Maps.app/Info.plist", 0), 0);
+  zip_discard(archive);
+  for (const auto& entry : fs::directory_iterator(root() / "tmp")) {
+    ADD_FAILURE() << "scratch left behind: " << entry.path();
+  }
+}
+
+TEST_F(ReplayActionsTest, PathsThatLeaveTheRootOrCrossALinkAreRefused) {
+  const fs::path outside = dir_.path() / "outside";
+  fs::create_directories(outside);
+  fs::create_directories(root() / "var/mobile");
+  fs::create_directory_symlink(outside, root() / "var/mobile/Media");
+  fs::create_directory_symlink(outside, root() / "linked");
+  const std::vector<std::pair<std::string, std::string>> cases = {
+      {"{stage: file, path: ../escape.txt, text: x}", "steps[0].path"},
+      {"{stage: file, path: /etc/escape.txt, text: x}", "steps[0].path"},
+      {"{stage: file, path: linked/escape.txt, text: x}", "steps[0].path"},
+      {"{stage: package, identifier: com.a, name: A}", "steps[0].stage"},
+      {"{stage: restore-list, content: {a: 1}}", "steps[0].stage"},
+      {"{stage: app, identifier: ../../Escape, name: A}", "steps[0].identifier"},
+      {"{event: store-download, app: com.a, package: ../A.zip}", "steps[0].package"},
+  };
+  for (const auto& [step, field] : cases) {
+    SCOPED_TRACE(step);
+    try {
+      run(step);
+      ADD_FAILURE() << "not refused";
+    } catch (const InputError& e) {
+      EXPECT_EQ(e.field(), field) << e.what();
+    }
+  }
+  EXPECT_TRUE(fs::is_empty(outside));
+  EXPECT_FALSE(fs::exists(dir_.path() / "escape.txt"));
+}
+
+TEST_F(ReplayActionsTest, PlatformChangesReachTheFakes) {
+  FakePlatform& device = session_->device();
+  run("{platform: fail, service: registry, operation: 'installApplication:withOptions:error:', "
+      "times: 1, error: {domain: AppRegistryError, code: 5, description: no space}}");
+  ErrorRef error;
+  EXPECT_FALSE(device.ar().installApplication("/nowhere", {}, &error));
+  ASSERT_TRUE(error);
+  EXPECT_EQ(error->domain, "AppRegistryError");
+  EXPECT_EQ(error->code, 5);
+  EXPECT_NE(error->describe().find("no space"), std::string::npos);
+
+  run("{platform: install-app, identifier: com.a, name: Notes, version: '2.0'}");
+  auto record = device.ar().application("com.a");
+  ASSERT_TRUE(record);
+  EXPECT_EQ(record->version, "2.0");
+  EXPECT_FALSE(record->isPlaceholder);
+  run("{platform: remove-app, app: com.a}");
+  EXPECT_FALSE(device.ar().application("com.a"));
+  EXPECT_EQ(device.em().uninstalled(), std::vector<std::string>{"com.a"});
+  EXPECT_THROW(run("{platform: remove-app, app: com.a}"), StepFailed);
+
+  run("{platform: deny-assertions, app: com.b, times: 2}");
+  for (std::int32_t expected : {kPVSAssertionDenied, kPVSAssertionDenied, kPVSAssertionGranted}) {
+    std::int32_t outcome = -1;
+    device.pv().PVSApplicationTerminationAssertionCreateWithError("com.b", 0, &outcome);
+    EXPECT_EQ(outcome, expected);
+  }
+  run("{platform: restrict, setting: allowAppRemoval, value: false}");
+  EXPECT_EQ(device.rs().effectiveBoolValueForSetting("allowAppRemoval"),
+            RSRestrictedBoolExplicitNo);
+  run("{platform: backup-data, app: com.b, size: 4096}");
+  std::uint64_t size = 0;
+  EXPECT_TRUE(
+      device.sw().newManager()->restoreDataExistsForApplicationWithBundleID("com.b", &size));
+  EXPECT_EQ(size, 4096u);
+}
+
+TEST_F(ReplayActionsTest, PluginOperationsWorkOnWhatTheHostComputerStaged) {
+  run("{stage: todo, list: [{identifier: com.a, operation: install}]}");
+  run("{plugin: changeAssetID, app: com.a, state: DOWNLOADED}");
+  const auto list = loadTodoList(session_->device().tr(), session_->paths().todoList(), nullptr);
+  ASSERT_TRUE(list && list->size() == 1 && (*list)[0].dict());
+  EXPECT_EQ(*(*list)[0].dict()->find("operation"), plist::Value("DOWNLOADED"));
+
+  session_->device().pv().setIconOrder({"com.b"});
+  const plist::Array ordered{plist::Dict{{"BNBundleIdentifier", "com.b"}},
+                             plist::Dict{{"BNBundleIdentifier", "com.a"}}};
+  EXPECT_EQ(run("{plugin: orderTheItems, apps: [com.a, com.b]}"), plist::Value(ordered));
+
+  run("{plugin: setRestoreStateProperty, app: com.a, version: '1.0', key: path, value: x.zip}");
+  EXPECT_EQ(run("{plugin: restoreStateProperty, app: com.a, version: '1.0', key: path}"),
+            plist::Value("x.zip"));
+  run("{plugin: cleanRestoreState, app: com.a}");
+  EXPECT_EQ(run("{plugin: restoreStateProperty, app: com.a, version: '1.0', key: path}"),
+            std::nullopt);
+
+  run("{stage: app, identifier: com.a, name: A, storeMetadata: {itemName: A}, artwork: true}");
+  const std::string dir = *session_->paths().packageDirectory("com.a");
+  const auto metadata =
+      plist::parse(readFile(Paths::packageMetadata(dir)).value_or(plist::Bytes{}));
+  EXPECT_EQ(metadata, plist::Value(plist::Dict{{"itemName", "A"}}));
+  std::string why;
+  EXPECT_TRUE(icon::decodePng(readFile(Paths::packageArtwork(dir)).value_or(plist::Bytes{}), &why))
+      << why;
+}
+
+TEST_F(ReplayActionsTest, CoordinatorEventsActOnTheCoordinationService) {
+  FakeKCInstallCoordination& kc = session_->device().kc();
+  auto coordinator = kc.putCoordinator(KCCoordinatorKind::Initiating, "com.c", KCClientBazaar);
+  coordinator->setAppAssetPromiseResponsibleClient(KCClientBazaar, nullptr);
+  run("{stage: package, identifier: com.c, name: C}");
+  run("{event: store-download, app: com.c, package: var/mobile/Media/PublicStaging/C.app}");
+  auto promise = coordinator->appAssetPromiseWithError(nullptr);
+  ASSERT_TRUE(promise);
+  EXPECT_TRUE(promise->isComplete());
+  EXPECT_EQ(promise->transferPath(), (root() / "var/mobile/Media/PublicStaging/C.app").string());
+
+  run("{event: promise-began, app: com.c, promise: asset}");
+  EXPECT_THROW(run("{event: promise-began, app: com.c, promise: user-data}"), StepFailed);
+  run("{event: coordinator-cancelled, app: com.c, client: 1, "
+      "reason: {domain: KCErrorDomain, code: 10, description: user}}");
+  EXPECT_EQ(coordinator->state(), FakeKCAppInstallCoordinator::State::Cancelled);
+  ASSERT_TRUE(coordinator->error());
+  EXPECT_EQ(coordinator->error()->code, 10);
+  EXPECT_THROW(run("{event: coordinator-prioritize, app: com.c}"), StepFailed);  // forgotten
+}
+
+TEST(ReplayEventsTest, StartupInsideTheHostDaemonCreatesTheCoordinationObserver) {
+  testing::TempDir dir;
+  FakePlatform::Options options;
+  options.coordination = true;
+  options.mainBundleIdentifier = std::string(kHostDaemonBundleIdentifier);
+  auto session = DeviceSession::create(dir.path() / "device", options);
+  const auto run = [&](const std::string& yaml) {
+    YamlField script = YamlField::loadText("steps:\n  - " + yaml + "\n", "script.yaml");
+    YamlField step = script["steps"].items().at(0);
+    YamlField value = step["event"];
+    StepContext context{*session, step, "event", value, dir.path()};
+    return runAction(context);
+  };
+  run("{event: hold, service: notifications}");
+  EXPECT_THROW(run("{event: startup}"), StepFailed);  // it would wait for ever
+  run("{event: release, service: notifications}");
+  EXPECT_EQ(run("{event: startup}"), plist::Value(plist::Dict{{"coordinationObserver", true}}));
+  EXPECT_THROW(run("{event: coordinator-prioritize, app: com.none}"), StepFailed);
+}
+
+}  // namespace
+}  // namespace appsync::host::replay

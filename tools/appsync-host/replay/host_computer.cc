@@ -1,0 +1,191 @@
+// `stage: KIND`: what the host computer leaves on the device before or during a sync: the todo
+// list, the icon layout, package directories with their store metadata and artwork, the
+// last-sync and demoted-apps lists, the restore list, packages in the public staging folder, and
+// any raw file (for hostile input). Everything is written through device_files.h: under the
+// root, never through a link. Property lists are written binary, as the host computer does.
+#include <cstdint>
+#include <functional>
+#include <string>
+#include <system_error>
+#include <vector>
+
+#include "bundle_maker.h"
+#include "device_files.h"
+#include "platform/icon/png_codec.h"
+#include "replay/action_table.h"
+#include "replay/actions.h"
+#include "replay/scratch_directory.h"
+
+namespace appsync::host::replay {
+
+namespace {
+
+namespace fs = std::filesystem;
+
+// A path the simulator forms (a fixed file, a package directory), checked like a script's:
+// no link on the way. `field` is named when it is refused.
+fs::path fixedPath(const StepContext& s, const std::string& path, const YamlField& field) {
+  const fs::path relative = fs::path(path).lexically_relative(s.session.root());
+  return devicePath(s.session.root(), relative.string(), field);
+}
+
+plist::Value readArray(const YamlField& field) {
+  plist::Value value = field.plist();
+  if (!value.array()) field.fail("expected a list");
+  return value;
+}
+
+ActionResult writePlistAt(const StepContext& s, const std::string& path,
+                          const plist::Value& value) {
+  writeDevicePlist(s.session.root(), fixedPath(s, path, s.value), value);
+  return std::nullopt;
+}
+
+// A square of one colour, derived from the identifier so that each app's artwork differs.
+plist::Bytes artworkFor(const std::string& identifier) {
+  const std::size_t hash = std::hash<std::string>{}(identifier);
+  icon::Image image(64, 64);
+  for (int y = 0; y < image.height; ++y) {
+    for (int x = 0; x < image.width; ++x) {
+      std::uint8_t* pixel = image.pixel(x, y);
+      pixel[0] = static_cast<std::uint8_t>(hash);
+      pixel[1] = static_cast<std::uint8_t>(hash >> 8);
+      pixel[2] = static_cast<std::uint8_t>(hash >> 16);
+      pixel[3] = 255;
+    }
+  }
+  std::string why;
+  auto png = icon::encodePng(image, &why);
+  if (!png) throw StepFailed("cannot make the artwork of " + identifier + ": " + why);
+  return *png;
+}
+
+std::string packageVersion(const StepContext& s) {
+  auto field = s.step.optional("version");
+  return field ? field->string() : std::string("1.0");
+}
+
+// CaravelStuff/ID with Info.plist, and CaravelMetadata.plist and CaravelArtwork when asked.
+ActionResult stageApp(StepContext& s) {
+  const YamlField idField = s.step["identifier"];
+  const std::string identifier = idField.string();
+  const auto directory = s.session.paths().packageDirectory(identifier);
+  if (!directory) idField.fail("\"" + identifier + "\" would leave the sync folder");
+  const fs::path& root = s.session.root();
+  const fs::path dir = fixedPath(s, *directory, idField);
+  plist::Dict info{{"BNBundleIdentifier", identifier},
+                   {"BNBundleVersion", packageVersion(s)},
+                   {"BNBundleDisplayName", s.step["name"].string()}};
+  const auto metadata = s.step.optional("storeMetadata");
+  const plist::Value storeMetadata = metadata ? plist::Value(readDict(*metadata)) : plist::Value();
+  const auto artwork = s.step.optional("artwork");
+  const bool withArtwork = artwork && artwork->boolean();
+
+  makeDeviceDirectory(root, dir);
+  writeDevicePlist(root, Paths::packageInfoPlist(dir.string()), info);
+  if (metadata) writeDevicePlist(root, Paths::packageMetadata(dir.string()), storeMetadata);
+  if (withArtwork)
+    writeDeviceFile(root, Paths::packageArtwork(dir.string()), artworkFor(identifier));
+  return std::nullopt;
+}
+
+// A bundle NAME.app (folder) or NAME.zip in the public staging folder; the result is its path.
+ActionResult stagePackage(StepContext& s) {
+  BundleSpec spec;
+  spec.identifier = s.step["identifier"].string();
+  spec.name = s.step["name"].string();
+  spec.version = packageVersion(s);
+  if (auto info = s.step.optional("info")) spec.extraInfo = readDict(*info);
+  if (auto icon = s.step.optional("icon")) spec.withIcon = icon->boolean();
+
+  const auto asField = s.step.optional("as");
+  const auto fileField = s.step.optional("file");
+  std::string kind = asField ? asField->string() : "";
+  if (asField && kind != "folder" && kind != "zip") {
+    asField->fail("unknown package kind \"" + kind + "\" (expected folder or zip)");
+  }
+  const std::string extension = fileField ? fs::path(fileField->string()).extension().string() : "";
+  if (fileField && extension != ".app" && extension != ".zip") {
+    fileField->fail("a package is a folder NAME.app or a zip archive NAME.zip");
+  }
+  if (kind.empty()) kind = extension == ".zip" ? "zip" : "folder";
+  const std::string wanted = kind == "zip" ? ".zip" : ".app";
+  if (fileField && extension != wanted) {
+    fileField->fail("a " + kind + " package is named NAME" + wanted);
+  }
+
+  const fs::path& root = s.session.root();
+  const fs::path staging = fixedPath(s, s.session.paths().publicStaging(), s.value);
+  const fs::path target =
+      fileField ? devicePath(staging, *fileField) : staging / (spec.name + wanted);
+  makeDeviceDirectory(root, target.parent_path());
+  ScratchDirectory scratch(root);
+  const fs::path bundle = makeBundle(root, scratch.path(), spec);
+  std::error_code ec;
+  fs::remove_all(target, ec);  // a package staged before under that name is replaced
+  if (kind == "zip") {
+    zipBundle(root, bundle, target);
+  } else {
+    fs::rename(bundle, target);  // throws filesystem_error: the step fails
+  }
+  return plist::Value(shownPath(root, target.string()));
+}
+
+// Any file, relative to the root: a property list (binary) or raw text.
+ActionResult stageFile(StepContext& s) {
+  const fs::path& root = s.session.root();
+  const fs::path path = devicePath(root, s.step["path"]);
+  const auto plistField = s.step.optional("plist");
+  const auto textField = s.step.optional("text");
+  if (plistField.has_value() == textField.has_value()) {
+    s.value.fail("give exactly one of `plist` and `text`");
+  }
+  if (plistField) {
+    writeDevicePlist(root, path, plistField->plist());
+  } else {
+    const std::string text = textField->string();
+    writeDeviceFile(root, path,
+                    std::span(reinterpret_cast<const std::uint8_t*>(text.data()), text.size()));
+  }
+  return std::nullopt;
+}
+
+const std::vector<ActionSpec>& stageTable() {
+  static const std::vector<ActionSpec> table = {
+      {"todo",
+       {"list"},
+       [](StepContext& s) {
+         return writePlistAt(s, s.session.paths().todoList(), readArray(s.step["list"]));
+       }},
+      {"icon-layout",
+       {"layout"},
+       [](StepContext& s) {
+         return writePlistAt(s, s.session.paths().iconLayout(), s.step["layout"].plist());
+       }},
+      {"app", {"identifier", "name", "version", "storeMetadata", "artwork"}, stageApp},
+      {"last-sync",
+       {"list"},
+       [](StepContext& s) {
+         return writePlistAt(s, s.session.paths().lastSyncAppState(), readArray(s.step["list"]));
+       }},
+      {"demoted",
+       {"apps"},
+       [](StepContext& s) {
+         return writePlistAt(s, s.session.paths().demotedApps(), readDict(s.step["apps"]));
+       }},
+      {"restore-list",
+       {"content"},
+       [](StepContext& s) {
+         return writePlistAt(s, s.session.paths().restoreList(), s.step["content"].plist());
+       }},
+      {"package", {"identifier", "name", "version", "as", "file", "info", "icon"}, stagePackage},
+      {"file", {"path", "plist", "text"}, stageFile},
+  };
+  return table;
+}
+
+}  // namespace
+
+ActionResult runHostComputer(StepContext& context) { return runFromTable(context, stageTable()); }
+
+}  // namespace appsync::host::replay

@@ -1,0 +1,124 @@
+// `plugin: NAME`: the plugin's own operations that no host operation reaches yet, called
+// directly so that scripts can exercise them. The list is kept short and shrinks as the host
+// operations that use them land; docs/replay-actions.md lists each with its fields:
+//   changeAssetID (app, state), notifyPavilion (starting), sendIconLayoutToPavilion,
+//   orderTheItems (apps) -> the ordered records, processCaravelRestoreInfoForApp (app,
+//   metadata, sinf, icon) -> bool, setRestoreStateProperty (app, version, key, value),
+//   restoreStateProperty (app, version, key) -> the value (no result when absent),
+//   cleanRestoreState (app), placeholderExists (app) -> bool,
+//   createPlaceHolderApplication (asset).
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "client/apps_client.h"
+#include "replay/action_table.h"
+#include "replay/actions.h"
+#include "replay/asset_spec.h"
+
+namespace appsync::host::replay {
+
+namespace {
+
+std::string appOf(const StepContext& c) { return c.step["app"].string(); }
+
+std::optional<std::string> versionOf(const StepContext& c) {
+  auto field = c.step.optional("version");
+  return field ? std::optional<std::string>(field->string()) : std::nullopt;
+}
+
+std::optional<plist::Bytes> optionalData(const StepContext& c, std::string_view key) {
+  auto field = c.step.optional(key);
+  return field ? std::optional<plist::Bytes>(readData(*field)) : std::nullopt;
+}
+
+// The candidates of orderTheItems: a list of identifiers (each the record
+// {"BNBundleIdentifier": ID}) or a mapping identifier -> record.
+plist::Dict orderCandidates(const YamlField& field) {
+  if (field.isMap()) return readDict(field);
+  plist::Dict items;
+  for (const std::string& identifier : field.strings()) {
+    items.set(identifier, plist::Dict{{"BNBundleIdentifier", identifier}});
+  }
+  return items;
+}
+
+const std::vector<ActionSpec>& pluginTable() {
+  static const std::vector<ActionSpec> table = {
+      {"changeAssetID",
+       {"app", "state"},
+       [](StepContext& s) -> ActionResult {
+         s.session.client().changeAssetID(appOf(s), s.step["state"].string());
+         return std::nullopt;
+       }},
+      {"notifyPavilion",
+       {"starting"},
+       [](StepContext& s) -> ActionResult {
+         AppsClient::_notifyPavilion(s.session.device().platform(), s.step["starting"].boolean());
+         return std::nullopt;
+       }},
+      {"sendIconLayoutToPavilion",
+       {},
+       [](StepContext& s) -> ActionResult {
+         AppsClient::_sendIconLayoutToPavilion(s.session.device().platform());
+         return std::nullopt;
+       }},
+      {"orderTheItems",
+       {"apps"},
+       [](StepContext& s) -> ActionResult {
+         plist::Dict items = orderCandidates(s.step["apps"]);
+         return plist::Value(AppsClient::_orderTheItems(s.session.device().platform(), items));
+       }},
+      {"processCaravelRestoreInfoForApp",
+       {"app", "metadata", "sinf", "icon"},
+       [](StepContext& s) -> ActionResult {
+         std::string bundleID = appOf(s);
+         plist::Bytes metadata = readDataOrPlist(s.step["metadata"]);
+         auto sinf = optionalData(s, "sinf");
+         auto icon = optionalData(s, "icon");
+         return plist::Value(
+             s.session.client()._processCaravelRestoreInfoForApp(bundleID, metadata, sinf, icon));
+       }},
+      {"setRestoreStateProperty",
+       {"app", "version", "key", "value"},
+       [](StepContext& s) -> ActionResult {
+         std::string bundleID = appOf(s);
+         plist::Value value = s.step["value"].plist();
+         s.session.client()._setRestoreStatePropertyValue(value, s.step["key"].string(), bundleID,
+                                                          versionOf(s));
+         return std::nullopt;
+       }},
+      {"restoreStateProperty",
+       {"app", "version", "key"},
+       [](StepContext& s) -> ActionResult {
+         std::string bundleID = appOf(s);
+         return s.session.client()._restoreStatePropertyForKey(s.step["key"].string(), bundleID,
+                                                               versionOf(s));
+       }},
+      {"cleanRestoreState",
+       {"app"},
+       [](StepContext& s) -> ActionResult {
+         s.session.client().cleanRestoreStateForIdentifier(appOf(s));
+         return std::nullopt;
+       }},
+      {"placeholderExists",
+       {"app"},
+       [](StepContext& s) -> ActionResult {
+         return plist::Value(s.session.client()._placeholderExistsForApplication(appOf(s)));
+       }},
+      {"createPlaceHolderApplication",
+       {"asset"},
+       [](StepContext& s) -> ActionResult {
+         auto asset = readAsset(s.step["asset"], s.session.root());
+         s.session.client()._createPlaceHolderApplication(asset);
+         return std::nullopt;
+       }},
+  };
+  return table;
+}
+
+}  // namespace
+
+ActionResult runPluginCall(StepContext& context) { return runFromTable(context, pluginTable()); }
+
+}  // namespace appsync::host::replay
