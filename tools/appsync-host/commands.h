@@ -8,9 +8,9 @@ namespace appsync::host {
 // Each returns the process exit status through `status` once its subcommand has run.
 void addPlistCommands(CLI::App& app, int& status);
 void addIconCommand(CLI::App& app, int& status);
-void addDemoCommand(CLI::App& app, int& status);
 // `device init`.
 void addDeviceCommands(CLI::App& app, int& status);
 void addShowCommand(CLI::App& app, int& status);
+void addReplayCommand(CLI::App& app, int& status);
 
 }  // namespace appsync::host

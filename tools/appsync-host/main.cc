@@ -9,11 +9,11 @@ int main(int argc, char** argv) {
   CLI::App app{"appsync-host: drive the application-sync plugin against a simulated device"};
   app.require_subcommand(1);
   int status = 0;
-  appsync::host::addDemoCommand(app, status);
   appsync::host::addPlistCommands(app, status);
   appsync::host::addIconCommand(app, status);
   appsync::host::addDeviceCommands(app, status);
   appsync::host::addShowCommand(app, status);
+  appsync::host::addReplayCommand(app, status);
   try {
     app.parse(argc, argv);
   } catch (const CLI::ParseError& e) {

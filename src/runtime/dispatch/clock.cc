@@ -30,7 +30,7 @@ bool ManualClock::waitUntil(std::unique_lock<std::mutex>& lock, std::condition_v
     if (now_ >= deadline) return false;
     // Registered while `lock` is held: an advance that happens from here on has to take that
     // lock to notify us, which it only gets once we are inside cv.wait().
-    self = waiters_.insert(waiters_.end(), Waiter{lock.mutex(), &cv});
+    self = waiters_.insert(waiters_.end(), Waiter{lock.mutex(), &cv, deadline});
     changed_.notify_all();
   }
   while (!ready() && now() < deadline) cv.wait(lock);
@@ -96,6 +96,26 @@ std::size_t ManualClock::waiterCount() const {
   std::size_t count = 0;
   for (const Waiter& w : waiters_) count += w.leaving ? 0 : 1;
   return count;
+}
+
+std::optional<TimePoint> ManualClock::earliestDeadline() const {
+  std::lock_guard<std::mutex> guard(mutex_);
+  std::optional<TimePoint> earliest;
+  for (const Waiter& w : waiters_) {
+    if (!w.leaving && (!earliest || w.deadline < *earliest)) earliest = w.deadline;
+  }
+  return earliest;
+}
+
+void ManualClock::waitForDueWaiters() const {
+  std::unique_lock<std::mutex> guard(mutex_);
+  // A record stays until its thread has left waitUntil; removeWaiter notifies changed_.
+  changed_.wait(guard, [&] {
+    for (const Waiter& w : waiters_) {
+      if (w.deadline <= now_) return false;
+    }
+    return true;
+  });
 }
 
 }  // namespace appsync

@@ -7,6 +7,7 @@
 #include <functional>
 #include <list>
 #include <mutex>
+#include <optional>
 
 namespace appsync {
 
@@ -49,6 +50,14 @@ class ManualClock final : public Clock {
   void waitForWaiters(std::size_t n) const;
   std::size_t waiterCount() const;
 
+  // The earliest deadline of the threads waiting now; absent when none waits with a deadline.
+  // With waitForDueWaiters it lets a driver move time from one deadline to the next, so that
+  // timers fire in order however far it moves.
+  std::optional<TimePoint> earliestDeadline() const;
+  // Blocks until every thread whose deadline the clock has reached has left its wait (it may
+  // have started another, with a later deadline).
+  void waitForDueWaiters() const;
+
  private:
   // A thread blocked in waitUntil, identified by the mutex and condition variable it waits on.
   // advance() notifies waiters without holding mutex_ (a waiter calls now() while holding its
@@ -57,6 +66,7 @@ class ManualClock final : public Clock {
   struct Waiter {
     std::mutex* mutex;
     std::condition_variable* cv;
+    TimePoint deadline;
     int notifying = 0;
     bool leaving = false;
   };

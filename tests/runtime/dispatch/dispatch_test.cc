@@ -178,5 +178,32 @@ TEST(ManualClockTest, ShortLivedWaitersSurviveConcurrentAdvances) {
   EXPECT_EQ(clock.waiterCount(), 0u);
 }
 
+// A driver moving time deadline by deadline: it learns the next deadline, and after moving the
+// clock there it knows the thread that was due has left its wait before it looks again.
+TEST(ManualClockTest, ReportsTheEarliestDeadlineAndWaitsForDueWaitersToLeave) {
+  ManualClock clock;
+  EXPECT_EQ(clock.earliestDeadline(), std::nullopt);
+  const TimePoint start = clock.now();
+  Semaphore never(0);
+  std::atomic<int> timedOut{0};
+  std::vector<std::thread> waiters;
+  for (auto delay : {20s, 10s}) {
+    waiters.emplace_back([&, delay] {
+      if (!never.waitUntil(clock, start + delay)) ++timedOut;
+    });
+  }
+  clock.waitForWaiters(2);
+  EXPECT_EQ(clock.earliestDeadline(), start + 10s);
+  clock.advance(10s);
+  clock.waitForDueWaiters();
+  EXPECT_EQ(clock.waiterCount(), 1u);
+  EXPECT_EQ(clock.earliestDeadline(), start + 20s);
+  clock.advance(15s);
+  clock.waitForDueWaiters();
+  EXPECT_EQ(clock.earliestDeadline(), std::nullopt);
+  for (std::thread& w : waiters) w.join();
+  EXPECT_EQ(timedOut.load(), 2);
+}
+
 }  // namespace
 }  // namespace appsync
