@@ -27,7 +27,7 @@
 namespace appsync::host {
 namespace {
 
-using nlohmann::json;
+using json = nlohmann::ordered_json;
 using testing::writeText;
 
 TEST(PlistToJsonTest, EveryTypeHasItsJsonForm) {

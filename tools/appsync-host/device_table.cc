@@ -10,7 +10,7 @@ namespace appsync::host {
 
 namespace {
 
-using nlohmann::json;
+using json = nlohmann::ordered_json;
 
 // A cell as a person reads it: text as it is, "-" for nothing, yes/no, anything else as JSON.
 std::string cellText(const json& value) {
@@ -233,7 +233,7 @@ void linesSection(Sections& out, const std::string& title, const std::vector<std
 
 }  // namespace
 
-std::string renderDeviceTable(const nlohmann::json& view, bool styled) {
+std::string renderDeviceTable(const nlohmann::ordered_json& view, bool styled) {
   Sections out(styled);
   out.heading("Device " + cellText(view.at("root")));
   registrySection(out, view.at("registry"), cellText(view.at("root")));

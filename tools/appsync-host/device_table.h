@@ -8,6 +8,6 @@
 namespace appsync::host {
 
 // `styled`: headings in bold (for a terminal); otherwise plain text.
-std::string renderDeviceTable(const nlohmann::json& view, bool styled);
+std::string renderDeviceTable(const nlohmann::ordered_json& view, bool styled);
 
 }  // namespace appsync::host

@@ -22,7 +22,7 @@ namespace appsync::host {
 
 namespace {
 
-using nlohmann::json;
+using json = nlohmann::ordered_json;
 
 template <class T>
 json optionalJson(const std::optional<T>& value) {
@@ -290,7 +290,7 @@ std::vector<std::string> lastLinesOfFile(const std::filesystem::path& path, std:
   return lines;
 }
 
-nlohmann::json collectDevice(FakePlatform& device, const std::filesystem::path& logFile,
+nlohmann::ordered_json collectDevice(FakePlatform& device, const std::filesystem::path& logFile,
                              std::size_t logLines) {
   std::error_code ec;
   const std::filesystem::path root = std::filesystem::absolute(device.paths().root(), ec);

@@ -4,7 +4,7 @@
 
 namespace appsync::host {
 
-nlohmann::json plistToJson(const plist::Value& value) {
+nlohmann::ordered_json plistToJson(const plist::Value& value) {
   switch (value.type()) {
     case plist::Type::Boolean:
       return *value.boolean();
@@ -27,12 +27,12 @@ nlohmann::json plistToJson(const plist::Value& value) {
     case plist::Type::Uid:
       return {{"uid", value.uid()->value}};
     case plist::Type::Array: {
-      nlohmann::json array = nlohmann::json::array();
+      nlohmann::ordered_json array = nlohmann::ordered_json::array();
       for (const plist::Value& item : *value.array()) array.push_back(plistToJson(item));
       return array;
     }
     case plist::Type::Dict: {
-      nlohmann::json object = nlohmann::json::object();
+      nlohmann::ordered_json object = nlohmann::ordered_json::object();
       for (const auto& entry : *value.dict()) object[entry.key] = plistToJson(entry.value);
       return object;
     }

@@ -11,6 +11,6 @@ namespace appsync::host {
 // Integers above INT64_MAX stay unsigned. A date outside years 0001-9999 is {"date": SECONDS}
 // (seconds since 2001-01-01, as a number); a keyed-archive reference is {"uid": N}; the
 // in-memory null is null.
-nlohmann::json plistToJson(const plist::Value& value);
+nlohmann::ordered_json plistToJson(const plist::Value& value);
 
 }  // namespace appsync::host

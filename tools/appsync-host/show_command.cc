@@ -28,11 +28,11 @@ int runShow(const ShowArguments& arguments) {
   std::string output;
   try {
     std::unique_ptr<DeviceSession> session = DeviceSession::open(arguments.root);
-    const nlohmann::json view =
+    const nlohmann::ordered_json view =
         collectDevice(session->device(), DeviceSession::logFile(arguments.root), arguments.lines);
     session->close();
     output = arguments.json
-                 ? view.dump(2, ' ', false, nlohmann::json::error_handler_t::replace) + "\n"
+                 ? view.dump(2, ' ', false, nlohmann::ordered_json::error_handler_t::replace) + "\n"
                  : renderDeviceTable(view, ::isatty(STDOUT_FILENO) == 1);
   } catch (const InputError& e) {
     std::fprintf(stderr, "appsync-host show: %s\n", e.what());
