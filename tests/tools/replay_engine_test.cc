@@ -69,6 +69,35 @@ TEST(ReplayEngineTest, AdvanceFiresEachTimerAtItsDeadlineInOrder) {
   EXPECT_EQ(countLines(out.str(), "\"outcome\":\"ok\""), 2u) << out.str();
 }
 
+// A held service keeps its events across the steps that follow (the engine settles the device
+// after every step without letting them go); closing the device delivers them.
+TEST(ReplayEngineTest, HeldEventsWaitUntilTheScriptReleasesThem) {
+  testing::TempDir dir;
+  auto session = host::DeviceSession::create(dir.path() / "device", {});
+  const auto script = scriptOf(dir,
+                               "steps:\n"
+                               "  - call: supportedDataclasses\n"
+                               "  - event: hold\n"
+                               "    service: registry\n"
+                               "  - platform: install-app\n"
+                               "    identifier: com.example.notes\n"
+                               "    name: Notes\n"
+                               "  - expect: registry\n"
+                               "    app: com.example.notes\n"
+                               "    version: \"1.0\"\n");
+  std::ostringstream out, errors;
+  Transcript transcript(out, false);
+  {
+    Runner runner(script, *session, transcript, errors);
+    EXPECT_EQ(runner.run(), 0u) << errors.str() << out.str();
+  }
+  CallbackThread& registryEvents = session->device().ar().callbackThread();
+  EXPECT_TRUE(registryEvents.isHeld());
+  EXPECT_GT(registryEvents.pendingCount(), 0u);
+  session->close();
+  EXPECT_EQ(registryEvents.pendingCount(), 0u);
+}
+
 TEST(ReplayEngineTest, BackgroundStepsAreCheckedWhenAwaitedAndFailWhenForgotten) {
   testing::TempDir dir;
   auto session = host::DeviceSession::create(dir.path() / "device", {});

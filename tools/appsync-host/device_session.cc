@@ -28,19 +28,21 @@ class DeviceLogSink : public LogSink {
   FileLogSink file_;
 };
 
-// Releases and drains every fake that delivers on a thread of its own; true when one of them
-// still had something queued before its drain.
-bool settleOnce(FakePlatform& device) {
+// Drains every fake that delivers on a thread of its own, except those whose deliveries a script
+// holds back (unless `releaseHeld`: then they are let go first). True when one of the drained
+// ones still had something queued.
+bool settleOnce(FakePlatform& device, bool releaseHeld) {
   bool busy = false;
   for (CallbackThread* thread :
        {&device.ar().callbackThread(), &device.system().callbackThread(),
         &device.tr().deviceService().callbackThread(), &device.bz().callbackThread()}) {
+    if (releaseHeld) thread->release();
+    if (thread->isHeld()) continue;
     busy = busy || thread->pendingCount() > 0;
-    thread->release();
     thread->drain();
   }
-  device.kc().release();
-  device.kc().drain();
+  if (releaseHeld) device.kc().release();
+  device.kc().drain();  // returns at once while held
   return busy;
 }
 
@@ -141,11 +143,13 @@ bool DeviceSession::hasClient() const {
   return client_ != nullptr;
 }
 
-void DeviceSession::settle() {
+void DeviceSession::settle() { settle(false); }
+
+void DeviceSession::settle(bool releaseHeld) {
   // Each delivery may make more (an observer that calls back into a service): go round until a
   // whole round finds nothing queued.
   for (int round = 0; round < 1000; ++round) {
-    if (!settleOnce(*device_) && round > 0) return;
+    if (!settleOnce(*device_, releaseHeld) && round > 0) return;
   }
   throw std::runtime_error("the device does not come to rest: its services keep making events");
 }
@@ -153,14 +157,14 @@ void DeviceSession::settle() {
 void DeviceSession::close() {
   if (closed_) return;
   closed_ = true;
-  settle();
+  settle(true);
   std::unique_ptr<AppsClient> client;
   {
     std::lock_guard lock(clientMutex_);
     client = std::move(client_);
   }
   client.reset();
-  settle();
+  settle(true);
   device_->saveState(stateDirectory(root_));
 }
 

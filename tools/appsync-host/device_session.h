@@ -45,11 +45,12 @@ class DeviceSession {
   AppsClient& client();
   bool hasClient() const;
 
-  // Lets every fake deliver what it holds (held events are released) and waits until no fake
-  // has anything left to deliver.
+  // Waits until no fake has anything left to deliver, except the services whose deliveries a
+  // script holds back: those keep their events until they are released.
   void settle();
-  // Settles, releases the client (which waits for its own work), settles again and saves the
-  // device. Throws std::runtime_error when the state cannot be written.
+  // Releases every held service and settles, releases the client (which waits for its own
+  // work), settles again and saves the device: no event is dropped. Throws std::runtime_error
+  // when the state cannot be written.
   void close();
 
   // Log lines and transaction-log entries since the last call: what one step produced.
@@ -62,6 +63,7 @@ class DeviceSession {
  private:
   DeviceSession(std::filesystem::path root, DeviceLock lock, FakePlatform::Options options);
   void attachLogs();
+  void settle(bool releaseHeld);
 
   std::filesystem::path root_;
   DeviceLock lock_;
