@@ -8,6 +8,7 @@
 #include "input_error.h"
 #include "platform/fake/state_fields.h"
 #include "runtime/fs/files.h"
+#include "runtime/plist/codec.h"
 
 namespace appsync::host {
 
@@ -58,6 +59,47 @@ std::filesystem::path DeviceSession::transactionFile(const std::filesystem::path
   return root / "transactions.log";
 }
 
+namespace {
+
+// Where a device was made. Its services and the client's files name paths under that root, so
+// a device opened anywhere else would have them read and written outside its own root.
+std::filesystem::path locationFile(const std::filesystem::path& root) {
+  return DeviceSession::stateDirectory(root) / "location.plist";
+}
+
+std::string canonicalRoot(const std::filesystem::path& root) {
+  std::error_code ec;
+  const auto canonical = std::filesystem::weakly_canonical(std::filesystem::absolute(root), ec);
+  return (ec ? root : canonical).string();
+}
+
+void recordLocation(const std::filesystem::path& root) {
+  const plist::Value location(plist::Dict{{"root", canonicalRoot(root)}});
+  ErrorRef error;
+  if (!writePlistAtomically(locationFile(root).string(), location, plist::Format::Xml, &error)) {
+    throw std::runtime_error(error->describe());
+  }
+}
+
+void checkLocation(const std::filesystem::path& root) {
+  const std::string file = locationFile(root).string();
+  auto bytes = readFile(file);
+  auto value = bytes ? plist::parse(*bytes) : std::nullopt;
+  const plist::Dict* dict = value ? value->dict() : nullptr;
+  const plist::Value* made = dict ? dict->find("root") : nullptr;
+  if (made == nullptr || made->string() == nullptr) {
+    throw InputError(file, 0, "root", "missing or not a text: the device's location is unknown");
+  }
+  if (*made->string() != canonicalRoot(root)) {
+    throw InputError(root.string(), 0, "",
+                     "this device was made at " + *made->string() +
+                         " and cannot be moved: its services and files name paths under that "
+                         "root (make a new device here with device init, or replay --fresh)");
+  }
+}
+
+}  // namespace
+
 std::unique_ptr<DeviceSession> DeviceSession::open(const std::filesystem::path& root) {
   const auto state = stateDirectory(root);
   std::error_code ec;
@@ -68,6 +110,7 @@ std::unique_ptr<DeviceSession> DeviceSession::open(const std::filesystem::path& 
                      "`appsync-host device init --root " + root.string() + "`");
   }
   DeviceLock lock = DeviceLock::acquire(state);
+  checkLocation(root);
   FakePlatform::Options options;
   try {
     options = FakePlatform::loadOptions(state);
@@ -97,6 +140,7 @@ std::unique_ptr<DeviceSession> DeviceSession::create(const std::filesystem::path
     throw InputError(root.string(), 0, "", "cannot create the device: " + ec.message());
   }
   DeviceLock lock = DeviceLock::acquire(state);
+  recordLocation(root);
   std::unique_ptr<DeviceSession> session(new DeviceSession(root, std::move(lock), options));
   session->attachLogs();
   return session;
