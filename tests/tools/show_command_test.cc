@@ -101,8 +101,9 @@ class ShowViewTest : public ::testing::Test {
     device_.system().notifyRegisterCheck(kSyncNotificationName, &token);
     device_.system().notifySetState(token, 1);
     device_.system().notifyPost(kSyncNotificationName);
-    const plist::Bytes layout = *plist::writeBinary(plist::Dict{
-        {"iconLists", plist::Array{plist::Array{"com.a"}}}, {"badge", plist::Bytes{0xde, 0xad}}});
+    const plist::Bytes layout = *plist::writeBinary(
+        plist::Dict{{"iconLists", plist::Array{plist::Value(plist::Array{"com.a"})}},
+                    {"badge", plist::Bytes{0xde, 0xad}}});
     device_.pv().PVSetIconState(device_.pv().PVSPavilionBlockableServerPort(), layout.data(),
                                 layout.size());
     device_.transactionLog().logStep(1, 1, 1, true, "com.a", "first");
@@ -139,8 +140,9 @@ TEST_F(ShowViewTest, GathersEveryService) {
   EXPECT_EQ(view["restore"]["listWaiting"], false);
   EXPECT_EQ(view["homeScreen"]["syncNotificationState"], 1);
   EXPECT_EQ(view["homeScreen"]["syncNotificationPosts"], 1);
-  EXPECT_EQ(view["homeScreen"]["iconState"],
-            (json{{"iconLists", {{"com.a"}}}, {"badge", {{"data", "3q0="}}}}));
+  EXPECT_EQ(
+      view["homeScreen"]["iconState"],
+      (json{{"iconLists", json::array({json::array({"com.a"})})}, {"badge", {{"data", "3q0="}}}}));
   EXPECT_EQ(view["installer"]["uninstalled"], json::array({"com.gone"}));
   EXPECT_EQ(view["restrictions"],
             (json{{"allowAppInstallation", "unset"}, {"allowAppRemoval", "no"}}));
