@@ -70,7 +70,7 @@ TEST(ReplayEngineTest, AdvanceFiresEachTimerAtItsDeadlineInOrder) {
 }
 
 // A held service keeps its events across the steps that follow (the engine settles the device
-// after every step without letting them go); closing the device delivers them.
+// after every step without letting them go); the end of the replay delivers them.
 TEST(ReplayEngineTest, HeldEventsWaitUntilTheScriptReleasesThem) {
   testing::TempDir dir;
   auto session = host::DeviceSession::create(dir.path() / "device", {});
@@ -85,17 +85,50 @@ TEST(ReplayEngineTest, HeldEventsWaitUntilTheScriptReleasesThem) {
                                "  - expect: registry\n"
                                "    app: com.example.notes\n"
                                "    version: \"1.0\"\n");
+  CallbackThread& registryEvents = session->device().ar().callbackThread();
+  std::vector<std::size_t> heldAfterSettling;  // events still queued each time the device rests
   std::ostringstream out, errors;
   Transcript transcript(out, false);
   {
     Runner runner(script, *session, transcript, errors);
+    runner.alsoSettle([&] { heldAfterSettling.push_back(registryEvents.pendingCount()); });
     EXPECT_EQ(runner.run(), 0u) << errors.str() << out.str();
   }
-  CallbackThread& registryEvents = session->device().ar().callbackThread();
-  EXPECT_TRUE(registryEvents.isHeld());
-  EXPECT_GT(registryEvents.pendingCount(), 0u);
-  session->close();
-  EXPECT_EQ(registryEvents.pendingCount(), 0u);
+  ASSERT_GE(heldAfterSettling.size(), 4u);
+  EXPECT_EQ(heldAfterSettling[1], 0u);  // held, nothing happened yet
+  EXPECT_GT(heldAfterSettling[2], 0u);  // the install's events wait ...
+  EXPECT_GT(heldAfterSettling[3], 0u);  // ... across the next step too
+  EXPECT_EQ(heldAfterSettling.back(), 0u);
+  EXPECT_FALSE(registryEvents.isHeld());
+}
+
+// An await of a step that waits for a held service fails with the reason instead of hanging,
+// and the replay still ends: what is held is let go at the end and the step finishes.
+TEST(ReplayEngineTest, AnAwaitThatCouldNeverFinishSaysWhy) {
+  testing::TempDir dir;
+  FakePlatform::Options daemon;
+  daemon.coordination = true;
+  daemon.mainBundleIdentifier = std::string(kHostDaemonBundleIdentifier);
+  auto session = host::DeviceSession::create(dir.path() / "device", daemon);
+  const auto script = scriptOf(dir,
+                               "steps:\n"
+                               "  - event: hold\n"
+                               "    service: notifications\n"
+                               "  - event: startup\n"
+                               "    background: up\n"
+                               "  - await: up\n");
+  std::ostringstream out, errors;
+  Transcript transcript(out, false);
+  {
+    Runner runner(script, *session, transcript, errors);
+    runner.setPatience(std::chrono::milliseconds(50));
+    EXPECT_EQ(runner.run(), 1u);
+  }
+  EXPECT_NE(errors.str().find("script.yaml:6: steps[2]: still running while the script holds "
+                              "notifications: release it before the await"),
+            std::string::npos)
+      << errors.str();
+  EXPECT_TRUE(session->client().hasInstallCoordinatorObserver());
 }
 
 TEST(ReplayEngineTest, BackgroundStepsAreCheckedWhenAwaitedAndFailWhenForgotten) {

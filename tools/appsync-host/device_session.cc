@@ -189,6 +189,20 @@ bool DeviceSession::hasClient() const {
 
 void DeviceSession::settle() { settle(false); }
 
+std::vector<std::string> DeviceSession::heldServices() {
+  std::vector<std::string> held;
+  const std::pair<const char*, CallbackThread*> threads[] = {
+      {"registry", &device_->ar().callbackThread()},
+      {"notifications", &device_->system().callbackThread()},
+      {"host", &device_->tr().deviceService().callbackThread()},
+      {"store", &device_->bz().callbackThread()}};
+  for (const auto& [name, thread] : threads) {
+    if (thread->isHeld()) held.emplace_back(name);
+  }
+  if (device_->kc().isHeld()) held.emplace_back("coordination");
+  return held;
+}
+
 void DeviceSession::settle(bool releaseHeld) {
   // Each delivery may make more (an observer that calls back into a service): go round until a
   // whole round finds nothing queued.

@@ -48,6 +48,11 @@ class DeviceSession {
   // Waits until no fake has anything left to deliver, except the services whose deliveries a
   // script holds back: those keep their events until they are released.
   void settle();
+  // The services whose deliveries a script holds back now ("registry", "coordination",
+  // "notifications", "host", "store").
+  std::vector<std::string> heldServices();
+  // Lets every held service go and settles.
+  void releaseHeld() { settle(true); }
   // Releases every held service and settles, releases the client (which waits for its own
   // work), settles again and saves the device: no event is dropped. Throws std::runtime_error
   // when the state cannot be written.

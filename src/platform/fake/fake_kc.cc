@@ -236,4 +236,6 @@ void FakeKCInstallCoordination::drain() { daemon_->drain(); }
 void FakeKCInstallCoordination::hold() { daemon_->hold(); }
 void FakeKCInstallCoordination::release() { daemon_->release(); }
 
+bool FakeKCInstallCoordination::isHeld() const { return daemon_->isHeld(); }
+
 }  // namespace appsync

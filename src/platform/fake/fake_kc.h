@@ -155,6 +155,7 @@ class FakeKCInstallCoordination final : public KCInstallCoordination, public Fak
   // While held, background work and events wait; release() lets them run in order.
   void hold();
   void release();
+  bool isHeld() const;
 
  private:
   friend class FakeKCDaemon;  // counts the calls it makes on the service's behalf

@@ -192,6 +192,11 @@ void FakeKCDaemon::release() {
   if (events_) events_->release();
 }
 
+bool FakeKCDaemon::isHeld() const {
+  std::lock_guard lock(mutex_);
+  return events_ && events_->isHeld();
+}
+
 void FakeKCDaemon::deliver(const Coordinator& c, const DelegateCall& call) {
   std::vector<KCAppInstallObserverDelegate*> targets;
   if (KCAppInstallObserverDelegate* observer = c.observer()) targets.push_back(observer);

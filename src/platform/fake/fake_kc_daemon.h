@@ -77,6 +77,7 @@ class FakeKCDaemon final : public FakeKCServiceHooks,
   void drain();
   void hold();
   void release();
+  bool isHeld() const;
   // Calls `call` on the coordinator's observer, then on the delegates registered for its
   // creator. Runs on the event thread, with no lock held during the calls.
   void deliver(const Coordinator& c, const DelegateCall& call);

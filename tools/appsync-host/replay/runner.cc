@@ -77,16 +77,64 @@ Runner::Runner(const Script& script, DeviceSession& session, Transcript& transcr
 Runner::~Runner() { joinAll(); }
 
 void Runner::joinAll() {
+  finishBackground();
   for (auto& [name, background] : background_) {
-    if (background.thread.joinable()) background.thread.join();
+    if (background->thread.joinable()) background->thread.join();
   }
+  for (auto& background : abandoned_) {
+    if (background->thread.joinable()) background->thread.join();
+  }
+}
+
+void Runner::finishBackground() {
+  session_.releaseHeld();
+  settle();
+  ManualClock& clock = session_.clock();
+  std::vector<Background*> running;
+  for (auto& [name, background] : background_) running.push_back(background.get());
+  for (auto& background : abandoned_) running.push_back(background.get());
+  for (Background* background : running) {
+    while (!background->done) {
+      if (auto next = clock.earliestDeadline()) {
+        if (*next > clock.now()) clock.advance(*next - clock.now());
+        clock.waitForDueWaiters();
+      } else {
+        std::this_thread::sleep_for(std::chrono::milliseconds(10));
+      }
+      settle();
+    }
+  }
+}
+
+std::optional<std::string> Runner::waitOrExplain(Background& background) {
+  // Real time, only to tell a step that cannot finish from one that is slow: the step either
+  // finishes or is found waiting on something only the script can move.
+  const auto giveUp = std::chrono::steady_clock::now() + patience_;
+  while (!background.done && std::chrono::steady_clock::now() < giveUp) {
+    std::this_thread::sleep_for(std::chrono::milliseconds(5));
+  }
+  if (background.done) return std::nullopt;
+  const std::vector<std::string> held = session_.heldServices();
+  if (!held.empty()) {
+    std::string names;
+    for (const auto& name : held) names += (names.empty() ? "" : ", ") + name;
+    return "still running while the script holds " + names + ": release it before the await";
+  }
+  if (session_.clock().waiterCount() > 0) {
+    return "still waiting for time to pass: advance the clock before the await";
+  }
+  background.thread.join();  // busy, not stuck
+  return std::nullopt;
 }
 
 std::size_t Runner::run() {
   for (const Step& step : script_.steps) runStep(step);
-  settle();
+  finishBackground();
   // A step started in the background and never awaited: collected now, and a failure.
-  for (auto& [name, background] : background_) {
+  for (auto& background : abandoned_) background->thread.join();
+  abandoned_.clear();
+  for (auto& [name, entry] : background_) {
+    Background& background = *entry;
     StepRecord record = recordOf(*background.step);
     record.background = name;
     const std::string failure = collect(background);
@@ -132,7 +180,9 @@ void Runner::runStep(const Step& step) {
 }
 
 void Runner::startBackground(const Step& step) {
-  Background& background = background_[*step.background];
+  auto& entry = background_[*step.background];
+  entry = std::make_unique<Background>();
+  Background& background = *entry;
   background.step = &step;
   background.thread = std::thread([this, &background, &step] {
     StepContext context{session_, step.field, step.selector, step.value, script_.directory};
@@ -141,11 +191,13 @@ void Runner::startBackground(const Step& step) {
     } catch (...) {
       background.error = std::current_exception();
     }
+    background.done = true;
   });
 }
 
 std::string Runner::collect(Background& background) {
-  background.thread.join();
+  if (auto stuck = waitOrExplain(background)) return *stuck;
+  if (background.thread.joinable()) background.thread.join();
   settle();
   if (!background.error) return "";
   try {
@@ -159,13 +211,15 @@ std::string Runner::collect(Background& background) {
 
 void Runner::runAwait(const Step& step, StepRecord& record) {
   auto found = background_.find(step.value.string());
-  const std::string failure = collect(found->second);
+  Background& background = *found->second;
+  const std::string failure = collect(background);
   if (failure.empty()) {
-    judgeResult(step.field, found->second.result, record);
+    judgeResult(step.field, background.result, record);
   } else {
-    record.result = found->second.result;
+    record.result = background.result;
     markFailed(record, failure);
   }
+  if (background.thread.joinable()) abandoned_.push_back(std::move(found->second));
   background_.erase(found);
 }
 

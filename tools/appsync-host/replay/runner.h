@@ -2,6 +2,9 @@
 // their own, virtual time moved deadline by deadline, and the device at rest after every step.
 #pragma once
 
+#include <atomic>
+#include <optional>
+
 #include <cstddef>
 #include <exception>
 #include <filesystem>
@@ -34,6 +37,9 @@ class Runner {
   // Work of the caller's own to wait for whenever the device is brought to rest, after the
   // session has settled (a test's own timer queue).
   void alsoSettle(std::function<void()> settle) { extraSettle_ = std::move(settle); }
+  // How long an await lets a background step run before it looks for a held service or a wait
+  // on the clock that keeps the step from finishing (real time; 10 seconds by default).
+  void setPatience(std::chrono::milliseconds patience) { patience_ = patience; }
 
   // Runs every step; returns how many failed. An action's bad arguments stop the replay with
   // InputError (background steps are collected first).
@@ -41,8 +47,9 @@ class Runner {
 
  private:
   struct Background {
-    const Step* step;
+    const Step* step = nullptr;
     std::thread thread;
+    std::atomic<bool> done{false};
     ActionResult result;
     std::exception_ptr error;
   };
@@ -52,6 +59,12 @@ class Runner {
   void startBackground(const Step& step);
   // Joins a background step; rethrows its InputError, else gives its failure (empty: none).
   std::string collect(Background& background);
+  // Waits for a background step to finish. When it is still running after a while and can only
+  // be waiting for a held service or for time to move, says so instead of waiting for ever.
+  std::optional<std::string> waitOrExplain(Background& background);
+  // Lets every held service go and moves time on until each background step has finished: the
+  // end of a replay, where nothing else would make them finish.
+  void finishBackground();
   void advance(Duration by);
   void settle();
   void finish(const Step& step, StepRecord& record, bool expectation);
@@ -62,7 +75,10 @@ class Runner {
   Transcript& transcript_;
   std::ostream& errors_;
   std::function<void()> extraSettle_;
-  std::map<std::string, Background> background_;
+  std::chrono::milliseconds patience_{10'000};
+  std::map<std::string, std::unique_ptr<Background>> background_;
+  // Awaited while they could not finish: joined at the end, once they can.
+  std::vector<std::unique_ptr<Background>> abandoned_;
   ReplayOutput output_;
   std::size_t failed_ = 0;
 };
