@@ -63,8 +63,13 @@ TEST(ReplayScriptTest, MalformedScriptsAreRefusedNamingLineStepAndField) {
       {"absolute path", "steps:\n  - expect: file\n    path: /etc/passwd\n",
        ":3: steps[0].path: \"/etc/passwd\" is absolute"},
       {"path leaving the root", "steps:\n  - expect: file\n    path: var/../../x\n",
-       ":3: steps[0].path: \"var/../../x\" leaves the device root"},
-      {"missing device file", "device: nowhere.yaml\nsteps: []\n", "nowhere.yaml: cannot read"},
+       ":3: steps[0].path: \"var/../../x\" has a \"..\" component: paths on the device only go "
+       "down"},
+      {"empty value, reported on its key's line",
+       "steps:\n  - expect: file\n    path:\n    exists: true\n",
+       ":3: steps[0].path: expected a text"},
+      {"missing device file", "device: nowhere.yaml\nsteps: []\n",
+       "script.yaml:1: device: no description file at"},
   };
   for (const MalformedScript& c : cases) {
     SCOPED_TRACE(c.name);

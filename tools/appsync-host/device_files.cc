@@ -20,7 +20,8 @@ void refuseLinks(const fs::path& root, const fs::path& path) {
     at /= part;
     std::error_code ec;
     if (fs::is_symlink(fs::symlink_status(at, ec))) {
-      throw std::runtime_error(at.string() + " is a symbolic link: nothing is written through it");
+      throw std::runtime_error(at.string() +
+                               " is a symbolic link: paths on the device never pass through one");
     }
   }
 }
@@ -38,7 +39,9 @@ fs::path devicePath(const fs::path& root, const std::string& relative, const Yam
     field.fail("\"" + relative + "\" is absolute: write it relative to the device root (var/...)");
   }
   for (const auto& part : path) {
-    if (part == "..") field.fail("\"" + relative + "\" leaves the device root");
+    if (part == "..") {
+      field.fail("\"" + relative + "\" has a \"..\" component: paths on the device only go down");
+    }
   }
   const fs::path full = (root / path).lexically_normal();
   try {

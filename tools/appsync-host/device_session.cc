@@ -107,7 +107,8 @@ std::unique_ptr<DeviceSession> DeviceSession::open(const std::filesystem::path& 
   if (!std::filesystem::is_directory(std::filesystem::symlink_status(state, ec))) {
     throw InputError(root.string(), 0, "",
                      "holds no device (no .platform directory); create one with "
-                     "`appsync-host device init --root " + root.string() + "`");
+                     "`appsync-host device init --root " +
+                         root.string() + "`");
   }
   DeviceLock lock = DeviceLock::acquire(state);
   checkLocation(root);

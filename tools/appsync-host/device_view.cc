@@ -291,7 +291,7 @@ std::vector<std::string> lastLinesOfFile(const std::filesystem::path& path, std:
 }
 
 nlohmann::ordered_json collectDevice(FakePlatform& device, const std::filesystem::path& logFile,
-                             std::size_t logLines) {
+                                     std::size_t logLines) {
   std::error_code ec;
   const std::filesystem::path root = std::filesystem::absolute(device.paths().root(), ec);
   return {{"root", root.lexically_normal().string()},

@@ -4,8 +4,8 @@
 #include <string>
 
 #include "commands.h"
-#include "runtime/fs/files.h"
 #include "platform/icon/home_screen_icon_service.h"
+#include "runtime/fs/files.h"
 
 namespace appsync::host {
 

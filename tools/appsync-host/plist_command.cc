@@ -1,9 +1,11 @@
 // appsync-host plist lint|convert: checks and converts property-list files.
+#include <algorithm>
 #include <cstdio>
 #include <string>
 #include <vector>
 
 #include "commands.h"
+#include "input_error.h"
 #include "runtime/fs/files.h"
 #include "runtime/plist/codec.h"
 
@@ -17,15 +19,17 @@ int lint(const std::vector<std::string>& files) {
     ErrorRef error;
     auto bytes = readFile(file, &error);
     if (!bytes) {
+      // A file that is not there is bad input; one that is not a valid property list is what
+      // lint reports.
       std::fprintf(stderr, "%s: cannot read: %s\n", file.c_str(), error->describe().c_str());
-      status = 1;
+      status = kExitBadInput;
       continue;
     }
     plist::ParseError parseError;
     plist::Format format;
     if (!plist::parse(*bytes, &parseError, &format)) {
       std::fprintf(stderr, "%s: %s\n", file.c_str(), parseError.message.c_str());
-      status = 1;
+      status = std::max(status, kExitFailed);
       continue;
     }
     std::printf("%s: ok (%s)\n", file.c_str(), format == plist::Format::Xml ? "xml" : "binary");
@@ -38,13 +42,13 @@ int convert(const std::string& to, const std::string& in, const std::string& out
   auto bytes = readFile(in, &error);
   if (!bytes) {
     std::fprintf(stderr, "%s: cannot read: %s\n", in.c_str(), error->describe().c_str());
-    return 1;
+    return kExitBadInput;
   }
   plist::ParseError parseError;
   auto value = plist::parse(*bytes, &parseError);
   if (!value) {
     std::fprintf(stderr, "%s: %s\n", in.c_str(), parseError.message.c_str());
-    return 1;
+    return kExitBadInput;
   }
   auto format = to == "xml" ? plist::Format::Xml : plist::Format::Binary;
   if (!writePlistAtomically(out, *value, format, &error)) {

@@ -97,16 +97,21 @@ YamlField::YamlField(YAML::Node node, std::shared_ptr<const std::string> file, s
     : node_(std::move(node)), file_(std::move(file)), path_(std::move(path)) {}
 
 int YamlField::line() const {
+  // An empty value has no place of its own: the parser puts it at the next token, often on the
+  // next line. Its key's line is where the reader looks.
+  if (keyLine_ > 0 && node_.IsNull()) return keyLine_;
   const YAML::Mark mark = node_.Mark();
-  return mark.is_null() ? 0 : mark.line + 1;
+  return mark.is_null() ? keyLine_ : mark.line + 1;
 }
 
 void YamlField::fail(const std::string& message) const {
   throw InputError(*file_, line(), path_, message);
 }
 
-YamlField YamlField::child(YAML::Node node, std::string path) const {
-  return YamlField(std::move(node), file_, std::move(path));
+YamlField YamlField::child(YAML::Node node, std::string path, const YAML::Node* key) const {
+  YamlField field(std::move(node), file_, std::move(path));
+  if (key != nullptr && !key->Mark().is_null()) field.keyLine_ = key->Mark().line + 1;
+  return field;
 }
 
 bool YamlField::has(std::string_view key) const {
@@ -122,9 +127,13 @@ YamlField YamlField::operator[](std::string_view key) const {
 
 std::optional<YamlField> YamlField::optional(std::string_view key) const {
   if (!node_.IsMap()) return std::nullopt;
-  const YAML::Node value = node_[std::string(key)];
-  if (!value.IsDefined()) return std::nullopt;
-  return child(value, path_.empty() ? std::string(key) : path_ + "." + std::string(key));
+  for (const auto& entry : node_) {
+    if (entry.first.IsScalar() && entry.first.Scalar() == key) {
+      return child(entry.second, path_.empty() ? std::string(key) : path_ + "." + std::string(key),
+                   &entry.first);
+    }
+  }
+  return std::nullopt;
 }
 
 void YamlField::allowOnly(std::initializer_list<std::string_view> keys) const {
@@ -151,7 +160,8 @@ std::vector<std::pair<std::string, YamlField>> YamlField::entries() const {
     const std::string key = entry.first.Scalar();
     if (!plist::text::isValidUtf8(key))
       child(entry.first, path_).fail("the key is not valid UTF-8");
-    out.emplace_back(key, child(entry.second, path_.empty() ? key : path_ + "." + key));
+    out.emplace_back(key,
+                     child(entry.second, path_.empty() ? key : path_ + "." + key, &entry.first));
   }
   return out;
 }

@@ -74,12 +74,14 @@ class YamlField {
   plist::Value plist() const;
 
  private:
-  YamlField child(YAML::Node node, std::string path) const;
+  // `key`: the mapping key the node is the value of, whose line an empty value reports.
+  YamlField child(YAML::Node node, std::string path, const YAML::Node* key = nullptr) const;
   std::string scalar(std::string_view expected) const;
 
   YAML::Node node_;
   std::shared_ptr<const std::string> file_;
   std::string path_;
+  int keyLine_ = 0;
 };
 
 }  // namespace appsync::host

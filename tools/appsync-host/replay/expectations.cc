@@ -65,7 +65,9 @@ void checkRelativePath(const YamlField& field) {
   if (path.is_absolute())
     field.fail(inQuotes(text) + " is absolute: write it relative to the root");
   for (const auto& part : path) {
-    if (part == "..") field.fail(inQuotes(text) + " leaves the device root");
+    if (part == "..") {
+      field.fail(inQuotes(text) + " has a \"..\" component: paths on the device only go down");
+    }
   }
 }
 

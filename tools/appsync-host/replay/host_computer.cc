@@ -137,9 +137,8 @@ ActionResult stageFile(StepContext& s) {
   const fs::path path = devicePath(root, s.step["path"]);
   const auto plistField = s.step.optional("plist");
   const auto textField = s.step.optional("text");
-  if (plistField.has_value() == textField.has_value()) {
-    s.value.fail("give exactly one of `plist` and `text`");
-  }
+  if (plistField && textField) textField->fail("give either `plist` or `text`, not both");
+  if (!plistField && !textField) s.value.fail("give the file's `plist` or its `text`");
   if (plistField) {
     writeDevicePlist(root, path, plistField->plist());
   } else {

@@ -105,8 +105,11 @@ ActionResult setRestriction(StepContext& s) {
   }
   const YamlField valueField = s.step["value"];
   int value = RSRestrictedBoolNoData;
-  if (valueField.string() != "none") {
-    value = valueField.boolean() ? RSRestrictedBoolExplicitYes : RSRestrictedBoolExplicitNo;
+  const std::string text = valueField.string();
+  if (text == "true" || text == "false") {
+    value = text == "true" ? RSRestrictedBoolExplicitYes : RSRestrictedBoolExplicitNo;
+  } else if (text != "none") {
+    valueField.fail("expected true, false or none, found \"" + text + "\"");
   }
   s.session.device().rs().setValue(setting, value);
   return std::nullopt;

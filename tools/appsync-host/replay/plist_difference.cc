@@ -5,9 +5,11 @@ namespace appsync::host::replay {
 
 namespace {
 
-// Texts in quotes, so that "1" and 1, or an empty text, can be told apart.
+// Texts in quotes, so that "1" and 1, or an empty text, can be told apart; booleans as the
+// script writes them, not as the 1 and 0 of a description.
 std::string shown(const plist::Value& value) {
   if (const std::string* text = value.string()) return "\"" + *text + "\"";
+  if (const bool* flag = value.boolean()) return *flag ? "true" : "false";
   return value.describe();
 }
 

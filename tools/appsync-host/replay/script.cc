@@ -113,6 +113,10 @@ Script readScript(const YamlField& document, const std::filesystem::path& direct
       script.device = *device;
     } else {
       const std::filesystem::path path = directory / device->string();
+      std::error_code ec;
+      if (!std::filesystem::is_regular_file(path, ec)) {
+        device->fail("no description file at " + path.string());
+      }
       script.device = YamlField::loadFile(path.string());
     }
   }
