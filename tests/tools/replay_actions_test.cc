@@ -243,35 +243,6 @@ TEST_F(ReplayActionsTest, PlatformChangesReachTheFakes) {
   EXPECT_EQ(size, 4096u);
 }
 
-TEST_F(ReplayActionsTest, PluginOperationsWorkOnWhatTheHostComputerStaged) {
-  run("{stage: todo, list: [{identifier: com.a, operation: install}]}");
-  run("{plugin: changeAssetID, app: com.a, state: DOWNLOADED}");
-  const auto list = loadTodoList(session_->device().tr(), session_->paths().todoList(), nullptr);
-  ASSERT_TRUE(list && list->size() == 1 && (*list)[0].dict());
-  EXPECT_EQ(*(*list)[0].dict()->find("operation"), plist::Value("DOWNLOADED"));
-
-  session_->device().pv().setIconOrder({"com.b"});
-  const plist::Array ordered{plist::Dict{{"BNBundleIdentifier", "com.b"}},
-                             plist::Dict{{"BNBundleIdentifier", "com.a"}}};
-  EXPECT_EQ(run("{plugin: orderTheItems, apps: [com.a, com.b]}"), plist::Value(ordered));
-
-  run("{plugin: setRestoreStateProperty, app: com.a, version: '1.0', key: path, value: x.zip}");
-  EXPECT_EQ(run("{plugin: restoreStateProperty, app: com.a, version: '1.0', key: path}"),
-            plist::Value("x.zip"));
-  run("{plugin: cleanRestoreState, app: com.a}");
-  EXPECT_EQ(run("{plugin: restoreStateProperty, app: com.a, version: '1.0', key: path}"),
-            std::nullopt);
-
-  run("{stage: app, identifier: com.a, name: A, storeMetadata: {itemName: A}, artwork: true}");
-  const std::string dir = *session_->paths().packageDirectory("com.a");
-  const auto metadata =
-      plist::parse(readFile(Paths::packageMetadata(dir)).value_or(plist::Bytes{}));
-  EXPECT_EQ(metadata, plist::Value(plist::Dict{{"itemName", "A"}}));
-  std::string why;
-  EXPECT_TRUE(icon::decodePng(readFile(Paths::packageArtwork(dir)).value_or(plist::Bytes{}), &why))
-      << why;
-}
-
 TEST_F(ReplayActionsTest, CoordinatorEventsActOnTheCoordinationService) {
   FakeKCInstallCoordination& kc = session_->device().kc();
   auto coordinator = kc.putCoordinator(KCCoordinatorKind::Initiating, "com.c", KCClientBazaar);
@@ -291,26 +262,6 @@ TEST_F(ReplayActionsTest, CoordinatorEventsActOnTheCoordinationService) {
   ASSERT_TRUE(coordinator->error());
   EXPECT_EQ(coordinator->error()->code, 10);
   EXPECT_THROW(run("{event: coordinator-prioritize, app: com.c}"), StepFailed);  // forgotten
-}
-
-TEST(ReplayEventsTest, StartupInsideTheHostDaemonCreatesTheCoordinationObserver) {
-  testing::TempDir dir;
-  FakePlatform::Options options;
-  options.coordination = true;
-  options.mainBundleIdentifier = std::string(kHostDaemonBundleIdentifier);
-  auto session = DeviceSession::create(dir.path() / "device", options);
-  const auto run = [&](const std::string& yaml) {
-    YamlField script = YamlField::loadText("steps:\n  - " + yaml + "\n", "script.yaml");
-    YamlField step = script["steps"].items().at(0);
-    YamlField value = step["event"];
-    StepContext context{*session, step, "event", value, dir.path()};
-    return runAction(context);
-  };
-  run("{event: hold, service: notifications}");
-  EXPECT_THROW(run("{event: startup}"), StepFailed);  // it would wait for ever
-  run("{event: release, service: notifications}");
-  EXPECT_EQ(run("{event: startup}"), plist::Value(plist::Dict{{"coordinationObserver", true}}));
-  EXPECT_THROW(run("{event: coordinator-prioritize, app: com.none}"), StepFailed);
 }
 
 }  // namespace
