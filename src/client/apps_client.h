@@ -136,6 +136,18 @@ class AppsClient : public TRClient,
   void _enumeratePlaceholdersWithBlock(const ProxyBlock& block);
   std::set<std::string> _getSystemAppPlaceholders();
 
+  // ---- Reporting (reporting/) ----------------------------------------------------------------
+  // {"_Count", "_PhysicalSize", "_PurgeableSize"} of the user's installed applications.
+  plist::Dict installedAssetMetrics() override;
+  // The store account identifiers, and one account record per identifier, read from each
+  // installed application's store metadata file.
+  std::set<std::string> vantorIDsForAssets() override;
+  std::vector<TRMutableAccountInfo> accountsForAssets() override;
+  // {"Application"} when the restrictions forbid both installing and removing applications.
+  std::optional<std::set<std::string>> disabledAssetTypes() override;
+  // Brings each installed application's store metadata file up to date before a backup.
+  void prepareForBackup() override;
+
   // ---- Facts for tests and the simulator -----------------------------------------------------
   bool useInstallCoordinator() const { return _useInstallCoordinator; }
   bool hasInstallCoordinatorObserver() const;

@@ -1,8 +1,9 @@
 // `stage: KIND`: what the host computer leaves on the device before or during a sync: the todo
 // list, the icon layout, package directories with their store metadata and artwork, the
-// last-sync and demoted-apps lists, the restore list, packages in the public staging folder, and
-// any raw file (for hostile input). Everything is written through device_files.h: under the
-// root, never through a link. Property lists are written binary, as the host computer does.
+// last-sync and demoted-apps lists, the restore list, packages in the public staging folder, any
+// raw file (for hostile input), and read-only files. Everything is written through
+// device_files.h: under the root, never through a link. Property lists are written binary, as the
+// host computer does.
 #include <cstdint>
 #include <functional>
 #include <string>
@@ -149,6 +150,19 @@ ActionResult stageFile(StepContext& s) {
   return std::nullopt;
 }
 
+// Takes every write permission off an existing file, as a restore or a user may leave it. The
+// path is checked like any other: under the root, no link on the way or at its end.
+ActionResult makeReadOnly(StepContext& s) {
+  const fs::path& root = s.session.root();
+  const fs::path path = devicePath(root, s.step["path"]);
+  if (!fs::is_regular_file(fs::symlink_status(path))) {
+    throw StepFailed(shownPath(root, path.string()) + " is not a file");
+  }
+  fs::permissions(path, fs::perms::owner_write | fs::perms::group_write | fs::perms::others_write,
+                  fs::perm_options::remove);  // throws filesystem_error: the step fails
+  return std::nullopt;
+}
+
 const std::vector<ActionSpec>& stageTable() {
   static const std::vector<ActionSpec> table = {
       {"todo",
@@ -179,6 +193,7 @@ const std::vector<ActionSpec>& stageTable() {
        }},
       {"package", {"identifier", "name", "version", "as", "file", "info", "icon"}, stagePackage},
       {"file", {"path", "plist", "text"}, stageFile},
+      {"read-only", {"path"}, makeReadOnly},
   };
   return table;
 }
