@@ -184,30 +184,6 @@ std::string rowOf(const std::string& table, const std::string& first) {
   return table.substr(at + 1, table.find('\n', at + 1) - at - 1);
 }
 
-TEST_F(ShowViewTest, TodoListEveryStateInItsRow) {
-  const std::vector<std::string> states = {"install",    "remove",    "SENT",
-                                           "DOWNLOADED", "INSTALLED", "FAILED"};
-  plist::Array list;
-  for (const std::string& state : states) {
-    list.push_back(plist::Dict{
-        {"identifier", "com.t." + state}, {"operation", state}, {"version", "3"}, {"name", "N"}});
-  }
-  list.push_back("not a record");
-  writePlist(device_.paths().todoList(), list);
-
-  const json view = collect();
-  const json& records = view["todoList"]["records"];
-  ASSERT_EQ(records.size(), states.size() + 1);
-  const std::string table = renderDeviceTable(view, false);
-  for (std::size_t i = 0; i < states.size(); ++i) {
-    EXPECT_EQ(records[i]["operation"], states[i]);
-    EXPECT_EQ(records[i]["version"], "3");
-    const std::string row = rowOf(table, "com.t." + states[i]);
-    EXPECT_NE(row.find(" " + states[i] + " "), std::string::npos) << table;
-  }
-  EXPECT_EQ(records.back()["record"], "not a record");
-}
-
 TEST_F(ShowViewTest, AnUnusableTodoListIsReportedNotLogged) {
   for (const char* text : {"<plist><array><string>broken", "<plist><dict/></plist>"}) {
     put(device_.paths().todoList(), text);
