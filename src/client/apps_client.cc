@@ -51,9 +51,9 @@ AppsClient::AppsClient(const Platform& platform)
   // must find every field built.
   platform_.ar.addObserver(this);
   if (insideHostDaemon_) {
-    platform_.system.addNotificationObserver(
-        this, &AppsClient::_handleTRCStartupCompletedNotification,
-        std::string(kHostStartupNotification));
+    platform_.system.addNotificationObserver(this,
+                                             &AppsClient::_handleTRCStartupCompletedNotification,
+                                             std::string(kHostStartupNotification));
   }
 }
 
@@ -100,7 +100,10 @@ std::vector<std::string> AppsClient::supportedDataclasses() {
 
 bool AppsClient::respondsTo(TRClientOperation operation) const {
   // The optional operations this client implements; the others abort when called.
-  static const std::set<TRClientOperation> kImplemented = {};
+  static const std::set<TRClientOperation> kImplemented = {
+      TRClientOperation::installedAssetMetrics, TRClientOperation::vantorIDsForAssets,
+      TRClientOperation::accountsForAssets, TRClientOperation::disabledAssetTypes,
+      TRClientOperation::prepareForBackup};
   return kImplemented.count(operation) > 0;
 }
 

@@ -1,0 +1,56 @@
+// Reading and rewriting an application's store metadata file without following links.
+#include "reporting/store_metadata.h"
+
+#include <sys/stat.h>
+
+#include <algorithm>
+#include <system_error>
+
+#include "runtime/fs/files.h"
+
+namespace appsync {
+
+namespace fs = std::filesystem;
+
+namespace {
+
+// True for a regular file (not a link to one) whose directory, links resolved, lies inside the
+// device root.
+bool isOwnFileInsideRoot(const std::string& path, const fs::path& deviceRoot) {
+  struct stat status {};
+  if (::lstat(path.c_str(), &status) != 0 || !S_ISREG(status.st_mode)) return false;
+  std::error_code error;
+  const fs::path directory = fs::canonical(fs::path(path).parent_path(), error);
+  if (error) return false;
+  const fs::path root = fs::canonical(deviceRoot, error);
+  if (error) return false;
+  return std::mismatch(root.begin(), root.end(), directory.begin(), directory.end()).first ==
+         root.end();
+}
+
+}  // namespace
+
+std::optional<std::string> storeMetadataPath(const std::optional<std::string>& container) {
+  if (!container) return std::nullopt;
+  return *container + "/" + std::string(kStoreMetadataFileName);
+}
+
+std::optional<StoreMetadata> loadStoreMetadata(const std::string& path,
+                                               const fs::path& deviceRoot) {
+  if (!isOwnFileInsideRoot(path, deviceRoot)) return std::nullopt;
+  std::optional<plist::Bytes> bytes = readFile(path);
+  if (!bytes) return std::nullopt;
+  StoreMetadata metadata;
+  std::optional<plist::Value> root = plist::parse(*bytes, nullptr, &metadata.format);
+  if (!root || !root->dict()) return std::nullopt;
+  metadata.root = std::move(*root->dict());
+  return metadata;
+}
+
+bool writeStoreMetadata(const std::string& path, const StoreMetadata& metadata,
+                        const fs::path& deviceRoot) {
+  if (!isOwnFileInsideRoot(path, deviceRoot)) return false;
+  return writePlistAtomically(path, plist::Value(metadata.root), metadata.format);
+}
+
+}  // namespace appsync

@@ -1,0 +1,39 @@
+// The store metadata file that sits beside an installed application, "CaravelMetadata.plist" in
+// the directory holding its bundle: where it is, reading it, and writing it back in place.
+#pragma once
+
+#include <filesystem>
+#include <optional>
+#include <string>
+#include <string_view>
+
+#include "runtime/plist/codec.h"
+#include "runtime/plist/value.h"
+
+namespace appsync {
+
+inline constexpr std::string_view kStoreMetadataFileName = "CaravelMetadata.plist";
+
+// CONTAINER/CaravelMetadata.plist; absent when the registry gives no container.
+std::optional<std::string> storeMetadataPath(const std::optional<std::string>& container);
+
+// One parsed metadata file and the format it was stored in.
+struct StoreMetadata {
+  plist::Dict root;
+  plist::Format format = plist::Format::Binary;
+};
+
+// The file's root dictionary. Absent when the file is missing, unreadable, not a property list
+// or not a dictionary, and when it is not a regular file of its own inside `deviceRoot`: a
+// symbolic link (never followed), a directory, a pipe, or a file whose directory resolves
+// outside the device root.
+std::optional<StoreMetadata> loadStoreMetadata(const std::string& path,
+                                               const std::filesystem::path& deviceRoot);
+
+// Replaces the file at `path` atomically with `metadata`, in the format it came in. Refuses
+// (false, nothing written) what loadStoreMetadata refuses, so nothing is ever written through a
+// link or outside the device root. False also when the write fails.
+bool writeStoreMetadata(const std::string& path, const StoreMetadata& metadata,
+                        const std::filesystem::path& deviceRoot);
+
+}  // namespace appsync
