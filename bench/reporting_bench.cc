@@ -2,11 +2,14 @@
 // 10,000 user applications whose files hold about 4 KB each: time per walk and how far the
 // process's resident memory rises above where it stood before the walk. Each file is to be
 // parsed and dropped before the next, so the rise must stay small whatever the number of apps.
+// The device lies in TMPDIR (default /tmp): prepareForBackup's atomic rewrites cost what that
+// file system charges for creating and replacing files.
 #include <benchmark/benchmark.h>
 #include <malloc.h>
 
 #include <algorithm>
 #include <atomic>
+#include <chrono>
 #include <cstdint>
 #include <cstdio>
 #include <cstdlib>
@@ -148,6 +151,17 @@ plist::Dict storeMetadata(int i) {
   return metadata;
 }
 
+// Written in place rather than through a temporary file: replacing 10,000 files just before the
+// walks would leave as many freed inodes behind, which the file system then skips over while
+// prepareForBackup creates its own temporary files, and the walk would pay for the set-up.
+bool writeNewFile(const std::string& path, const plist::Bytes& bytes) {
+  std::ofstream file(path, std::ios::binary | std::ios::trunc);
+  file.write(reinterpret_cast<const char*>(bytes.data()),
+             static_cast<std::streamsize>(bytes.size()));
+  file.close();
+  return static_cast<bool>(file);
+}
+
 // The device, built once per process: 10,000 installed user applications, each container
 // holding its store metadata file, with a pristine copy of every file kept aside so that
 // prepareForBackup's rewrites can be undone.
@@ -168,8 +182,7 @@ class ReportingDevice {
       if (!container || !createDirectories(*container)) return;
       const std::string file = *container + "/" + kMetadataName;
       std::optional<plist::Bytes> bytes = plist::writeBinary(storeMetadata(i));
-      if (!bytes || !writeFileAtomically(file, *bytes) ||
-          !copyFile(file, pristineCopy(i).string())) {
+      if (!bytes || !writeNewFile(file, *bytes) || !copyFile(file, pristineCopy(i).string())) {
         return;
       }
       metadataBytes_ += bytes->size();
@@ -265,6 +278,7 @@ class PeakGrowth {
 template <typename Walk, typename Check>
 void measureWalks(benchmark::State& state, ReportingDevice& device, Walk walk, Check check) {
   double worstGrowth = 0;
+  double slowestSeconds = 0;
   for (auto _ : state) {
     state.PauseTiming();
     PeakGrowth growth;
@@ -273,7 +287,9 @@ void measureWalks(benchmark::State& state, ReportingDevice& device, Walk walk, C
       break;
     }
     state.ResumeTiming();
+    const auto start = std::chrono::steady_clock::now();
     walk();
+    const std::chrono::duration<double> took = std::chrono::steady_clock::now() - start;
     state.PauseTiming();
     const double grown = growth.stop();
     const std::string problem = check();
@@ -284,8 +300,11 @@ void measureWalks(benchmark::State& state, ReportingDevice& device, Walk walk, C
       break;
     }
     worstGrowth = std::max(worstGrowth, grown);
+    slowestSeconds = std::max(slowestSeconds, took.count());
   }
   state.counters["peak_growth_MB"] = worstGrowth;
+  // The time reported is the mean; the target is for every walk.
+  state.counters["slowest_ms"] = slowestSeconds * 1000;
   state.counters["apps"] = kApps;
   state.counters["file_KB"] = device.averageFileBytes() / 1024.0;
 }
