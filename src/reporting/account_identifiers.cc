@@ -76,6 +76,8 @@ std::set<std::string> AppsClient::vantorIDsForAssets() {
   logDefault("%s|getting id's for assets");
   const TypedLookup lookup(platform_.tr.TRGetLogCategory(kTypeCheckLogCategory));
   std::set<std::string> identifiers;
+  const std::optional<std::filesystem::path> deviceRoot =
+      resolvedDeviceRoot(platform_.paths.root());
   platform_.ar.enumerateBundlesOfType(
       ARBundleTypeApplications,
       [&](const std::shared_ptr<const ARBundleProxy>& proxy, bool* /*stop*/) {
@@ -84,7 +86,7 @@ std::set<std::string> AppsClient::vantorIDsForAssets() {
         // Each application's file lives only for this call.
         const std::optional<std::string> path = storeMetadataPath(application->bundleContainerURL);
         std::optional<StoreMetadata> metadata;
-        if (path) metadata = loadStoreMetadata(*path, platform_.paths.root());
+        if (path && deviceRoot) metadata = loadStoreMetadata(*path, *deviceRoot);
         const plist::Dict* root = metadata ? &metadata->root : nullptr;
 
         std::optional<std::string> older = lookup.string(root, kTopLevelAccountKey, "vantorID");
@@ -117,6 +119,8 @@ std::vector<TRMutableAccountInfo> AppsClient::accountsForAssets() {
   const TypedLookup lookup(platform_.tr.TRGetLogCategory(kTypeCheckLogCategory));
   std::vector<TRMutableAccountInfo> accounts;
   std::set<std::string> seen;
+  const std::optional<std::filesystem::path> deviceRoot =
+      resolvedDeviceRoot(platform_.paths.root());
   platform_.ar.enumerateBundlesOfType(
       ARBundleTypeApplications,
       [&](const std::shared_ptr<const ARBundleProxy>& proxy, bool* /*stop*/) {
@@ -125,7 +129,7 @@ std::vector<TRMutableAccountInfo> AppsClient::accountsForAssets() {
         // Each application's file lives only for this call.
         const std::optional<std::string> path = storeMetadataPath(application->bundleContainerURL);
         std::optional<StoreMetadata> metadata;
-        if (path) metadata = loadStoreMetadata(*path, platform_.paths.root());
+        if (path && deviceRoot) metadata = loadStoreMetadata(*path, *deviceRoot);
         const plist::Dict* root = metadata ? &metadata->root : nullptr;
 
         const plist::Dict* downloadInfo = lookup.dict(root, kDownloadInfoKey, "downloadInfo");

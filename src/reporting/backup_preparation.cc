@@ -20,6 +20,8 @@ std::optional<std::set<std::string>> AppsClient::disabledAssetTypes() {
 
 void AppsClient::prepareForBackup() {
   logDefault("%s|preparing for backup");
+  const std::optional<std::filesystem::path> deviceRoot =
+      resolvedDeviceRoot(platform_.paths.root());
   platform_.ar.enumerateBundlesOfType(
       ARBundleTypeApplications,
       [&](const std::shared_ptr<const ARBundleProxy>& proxy, bool* /*stop*/) {
@@ -27,8 +29,8 @@ void AppsClient::prepareForBackup() {
         if (!application) return;
         // Each application's file lives only for this call.
         const std::optional<std::string> path = storeMetadataPath(application->bundleContainerURL);
-        if (!path) return;
-        std::optional<StoreMetadata> metadata = loadStoreMetadata(*path, platform_.paths.root());
+        if (!path || !deviceRoot) return;
+        std::optional<StoreMetadata> metadata = loadStoreMetadata(*path, *deviceRoot);
         if (!metadata) return;
         plist::Dict& root = metadata->root;
         bool changed = false;
@@ -48,7 +50,7 @@ void AppsClient::prepareForBackup() {
           changed = true;
         }
         // The backup goes ahead whether or not the write succeeds.
-        if (changed) writeStoreMetadata(*path, *metadata, platform_.paths.root());
+        if (changed) writeStoreMetadata(*path, *metadata, *deviceRoot);
       });
   logDefault("%s|finished preparing for backup");
 }

@@ -22,13 +22,18 @@ bool isOwnFileInsideRoot(const std::string& path, const fs::path& deviceRoot) {
   std::error_code error;
   const fs::path directory = fs::canonical(fs::path(path).parent_path(), error);
   if (error) return false;
-  const fs::path root = fs::canonical(deviceRoot, error);
-  if (error) return false;
-  return std::mismatch(root.begin(), root.end(), directory.begin(), directory.end()).first ==
-         root.end();
+  return std::mismatch(deviceRoot.begin(), deviceRoot.end(), directory.begin(), directory.end())
+             .first == deviceRoot.end();
 }
 
 }  // namespace
+
+std::optional<fs::path> resolvedDeviceRoot(const fs::path& deviceRoot) {
+  std::error_code error;
+  fs::path root = fs::canonical(deviceRoot, error);
+  if (error) return std::nullopt;
+  return root;
+}
 
 std::optional<std::string> storeMetadataPath(const std::optional<std::string>& container) {
   if (!container) return std::nullopt;

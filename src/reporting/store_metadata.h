@@ -17,6 +17,10 @@ inline constexpr std::string_view kStoreMetadataFileName = "CaravelMetadata.plis
 // CONTAINER/CaravelMetadata.plist; absent when the registry gives no container.
 std::optional<std::string> storeMetadataPath(const std::optional<std::string>& container);
 
+// The device root with its links resolved, as the functions below take it: resolved once per
+// walk, not once per file. Absent when the root cannot be resolved (then nothing is read).
+std::optional<std::filesystem::path> resolvedDeviceRoot(const std::filesystem::path& deviceRoot);
+
 // One parsed metadata file and the format it was stored in.
 struct StoreMetadata {
   plist::Dict root;
@@ -26,7 +30,7 @@ struct StoreMetadata {
 // The file's root dictionary. Absent when the file is missing, unreadable, not a property list
 // or not a dictionary, and when it is not a regular file of its own inside `deviceRoot`: a
 // symbolic link (never followed), a directory, a pipe, or a file whose directory resolves
-// outside the device root.
+// outside the device root. `deviceRoot` is the resolved root (resolvedDeviceRoot).
 std::optional<StoreMetadata> loadStoreMetadata(const std::string& path,
                                                const std::filesystem::path& deviceRoot);
 
