@@ -49,13 +49,19 @@ std::optional<StoreMetadata> loadStoreMetadata(const std::string& path,
   std::optional<plist::Value> root = plist::parse(*bytes, nullptr, &metadata.format);
   if (!root || !root->dict()) return std::nullopt;
   metadata.root = std::move(*root->dict());
+  metadata.bytes = std::move(*bytes);
   return metadata;
 }
 
 bool writeStoreMetadata(const std::string& path, const StoreMetadata& metadata,
                         const fs::path& deviceRoot) {
   if (!isOwnFileInsideRoot(path, deviceRoot)) return false;
-  return writePlistAtomically(path, plist::Value(metadata.root), metadata.format);
+  std::optional<plist::Bytes> bytes = plist::write(plist::Value(metadata.root), metadata.format);
+  if (!bytes) return false;
+  // Most rewrites before a backup set "DeviceBasedBLK" to the value it already has: replacing
+  // a file with its own bytes would only cost a new file and leave the content as it was.
+  if (*bytes == metadata.bytes) return true;
+  return writeFileAtomically(path, *bytes);
 }
 
 }  // namespace appsync

@@ -25,6 +25,7 @@ std::optional<std::filesystem::path> resolvedDeviceRoot(const std::filesystem::p
 struct StoreMetadata {
   plist::Dict root;
   plist::Format format = plist::Format::Binary;
+  plist::Bytes bytes;  // as read
 };
 
 // The file's root dictionary. Absent when the file is missing, unreadable, not a property list
@@ -34,7 +35,8 @@ struct StoreMetadata {
 std::optional<StoreMetadata> loadStoreMetadata(const std::string& path,
                                                const std::filesystem::path& deviceRoot);
 
-// Replaces the file at `path` atomically with `metadata`, in the format it came in. Refuses
+// Replaces the file at `path` atomically with `metadata`, in the format it came in; when that
+// would give the very bytes the file holds, it is left as it is (true). Refuses
 // (false, nothing written) what loadStoreMetadata refuses, so nothing is ever written through a
 // link or outside the device root. False also when the write fails.
 bool writeStoreMetadata(const std::string& path, const StoreMetadata& metadata,
