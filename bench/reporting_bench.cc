@@ -23,6 +23,7 @@
 #include <string>
 #include <vector>
 
+#include "bench_support.h"
 #include "client/apps_client.h"
 #include "platform/fake/fake_platform.h"
 #include "runtime/fs/files.h"
@@ -38,18 +39,7 @@ constexpr int kAccounts = 4;
 constexpr const char* kMetadataName = "CaravelMetadata.plist";
 constexpr const char* kDownloadInfoKey = "com.vantor.CaravelStore.downloadInfo";
 
-// The walks log as in production, but the lines are only counted: the fake host's memory sink
-// would grow with every line and be counted as the walk's own memory.
-class CountingLogSink final : public LogSink {
- public:
-  void write(int, LogLevel, std::string_view) override {
-    count_.fetch_add(1, std::memory_order_relaxed);
-  }
-  std::uint64_t count() const { return count_.load(); }
-
- private:
-  std::atomic<std::uint64_t> count_{0};
-};
+using bench::CountingLogSink;
 
 std::string format(const char* pattern, int value) {
   char text[160];

@@ -13,27 +13,17 @@
 #include <thread>
 #include <vector>
 
+#include "bench_support.h"
+#include "platform/fake/fake_tr.h"
 #include "runtime/fs/files.h"
 #include "runtime/log/log.h"
 #include "runtime/plist/codec.h"
-#include "platform/fake/fake_tr.h"
 #include "state/todo_list.h"
 
 namespace appsync {
 namespace {
 
-// Logging stays on as in production, but the lines are only counted: a memory sink would grow
-// for the whole run.
-class CountingLogSink final : public LogSink {
- public:
-  void write(int, LogLevel, std::string_view) override {
-    count_.fetch_add(1, std::memory_order_relaxed);
-  }
-  std::uint64_t count() const { return count_.load(); }
-
- private:
-  std::atomic<std::uint64_t> count_{0};
-};
+using bench::CountingLogSink;
 
 std::string numbered(const char* prefix, int i) {
   char text[48];

@@ -76,17 +76,10 @@ std::set<std::string> AppsClient::vantorIDsForAssets() {
   logDefault("%s|getting id's for assets");
   const TypedLookup lookup(platform_.tr.TRGetLogCategory(kTypeCheckLogCategory));
   std::set<std::string> identifiers;
-  const std::optional<std::filesystem::path> deviceRoot =
-      resolvedDeviceRoot(platform_.paths.root());
-  platform_.ar.enumerateBundlesOfType(
-      ARBundleTypeApplications,
-      [&](const std::shared_ptr<const ARBundleProxy>& proxy, bool* /*stop*/) {
-        const ARApplicationProxy* application = proxy->asApplicationProxy();
-        if (!application) return;
-        // Each application's file lives only for this call.
-        const std::optional<std::string> path = storeMetadataPath(application->bundleContainerURL);
-        std::optional<StoreMetadata> metadata;
-        if (path && deviceRoot) metadata = loadStoreMetadata(*path, *deviceRoot);
+  forEachApplicationMetadata(
+      platform_.ar, platform_.paths.root(),
+      [&](const ARApplicationProxy& application, const std::optional<std::string>& path,
+          std::optional<StoreMetadata>& metadata) {
         const plist::Dict* root = metadata ? &metadata->root : nullptr;
 
         std::optional<std::string> older = lookup.string(root, kTopLevelAccountKey, "vantorID");
@@ -98,7 +91,7 @@ std::set<std::string> AppsClient::vantorIDsForAssets() {
         if (older && newer) {
           if (*older != *newer) {
             logDefault("%s|mismatched VantorID keys for %{public}@: %{public}@ vs %{public}@",
-                       application->applicationIdentifier, *older, *newer);
+                       application.applicationIdentifier, *older, *newer);
           }
           identifiers.insert(*older);
           identifiers.insert(*newer);
@@ -106,7 +99,7 @@ std::set<std::string> AppsClient::vantorIDsForAssets() {
           identifiers.insert(older ? *older : *newer);
         } else {
           logDefault("%s|unknown VantorID for %{public}@ (plist at %{public}@)",
-                     application->applicationIdentifier, path);
+                     application.applicationIdentifier, path);
         }
       });
   logDefault("%s|Returning vantor ID set: %{public}@",
@@ -119,17 +112,10 @@ std::vector<TRMutableAccountInfo> AppsClient::accountsForAssets() {
   const TypedLookup lookup(platform_.tr.TRGetLogCategory(kTypeCheckLogCategory));
   std::vector<TRMutableAccountInfo> accounts;
   std::set<std::string> seen;
-  const std::optional<std::filesystem::path> deviceRoot =
-      resolvedDeviceRoot(platform_.paths.root());
-  platform_.ar.enumerateBundlesOfType(
-      ARBundleTypeApplications,
-      [&](const std::shared_ptr<const ARBundleProxy>& proxy, bool* /*stop*/) {
-        const ARApplicationProxy* application = proxy->asApplicationProxy();
-        if (!application) return;
-        // Each application's file lives only for this call.
-        const std::optional<std::string> path = storeMetadataPath(application->bundleContainerURL);
-        std::optional<StoreMetadata> metadata;
-        if (path && deviceRoot) metadata = loadStoreMetadata(*path, *deviceRoot);
+  forEachApplicationMetadata(
+      platform_.ar, platform_.paths.root(),
+      [&](const ARApplicationProxy&, const std::optional<std::string>&,
+          std::optional<StoreMetadata>& metadata) {
         const plist::Dict* root = metadata ? &metadata->root : nullptr;
 
         const plist::Dict* downloadInfo = lookup.dict(root, kDownloadInfoKey, "downloadInfo");

@@ -64,4 +64,18 @@ bool writeStoreMetadata(const std::string& path, const StoreMetadata& metadata,
   return writeFileAtomically(path, *bytes);
 }
 
+void forEachApplicationMetadata(ARApplicationWorkspace& registry, const fs::path& deviceRoot,
+                                const StoreMetadataVisitor& visit) {
+  const std::optional<fs::path> root = resolvedDeviceRoot(deviceRoot);
+  registry.enumerateBundlesOfType(
+      ARBundleTypeApplications, [&](const std::shared_ptr<const ARBundleProxy>& proxy, bool*) {
+        const ARApplicationProxy* application = proxy->asApplicationProxy();
+        if (!application) return;
+        const std::optional<std::string> path = storeMetadataPath(application->bundleContainerURL);
+        std::optional<StoreMetadata> metadata;
+        if (path && root) metadata = loadStoreMetadata(*path, *root);
+        visit(*application, path, metadata);
+      });
+}
+
 }  // namespace appsync

@@ -3,10 +3,12 @@
 #pragma once
 
 #include <filesystem>
+#include <functional>
 #include <optional>
 #include <string>
 #include <string_view>
 
+#include "platform/ar.h"
 #include "runtime/plist/codec.h"
 #include "runtime/plist/value.h"
 
@@ -41,5 +43,15 @@ std::optional<StoreMetadata> loadStoreMetadata(const std::string& path,
 // link or outside the device root. False also when the write fails.
 bool writeStoreMetadata(const std::string& path, const StoreMetadata& metadata,
                         const std::filesystem::path& deviceRoot);
+
+// Walks the applications of the registry (bundle kind 1), handing each to `visit` with the path
+// of its metadata file (absent without a container) and the file as read (absent when it is
+// missing or refused). Each file lives only for its own call: the walk holds one at a time.
+using StoreMetadataVisitor = std::function<void(const ARApplicationProxy& application,
+                                                const std::optional<std::string>& path,
+                                                std::optional<StoreMetadata>& metadata)>;
+void forEachApplicationMetadata(ARApplicationWorkspace& registry,
+                                const std::filesystem::path& deviceRoot,
+                                const StoreMetadataVisitor& visit);
 
 }  // namespace appsync
