@@ -190,8 +190,8 @@ TEST(DeviceDescriptionErrorsTest, BadDescriptionsNameTheLineAndTheField) {
 
 TEST(BundleMakerTest, BundlesRenderPackAndStayUnderTheRoot) {
   testing::TempDir root;
-  const BundleSpec spec{.identifier = "com.a.notes", .name = "Notes", .version = "3"};
-  const fs::path bundle = makeBundle(root.path(), root.path() / "b", spec);
+  const BundleFacts facts{.identifier = "com.a.notes", .name = "Notes", .version = "3"};
+  const fs::path bundle = makeBundle(root.path(), root.path() / "b", facts);
   EXPECT_EQ(bundle, root.path() / "b" / "Notes.app");
   std::string why;
   EXPECT_TRUE(renderIconPng(bundle.string(), 57, &why)) << why;
@@ -223,12 +223,12 @@ TEST(BundleMakerTest, BundlesRenderPackAndStayUnderTheRoot) {
 
   // Nothing outside the root, and no link packed or written through.
   testing::TempDir outside;
-  EXPECT_THROW(makeBundle(root.path(), root.path() / ".." / "x", spec), std::runtime_error);
+  EXPECT_THROW(makeBundle(root.path(), root.path() / ".." / "x", facts), std::runtime_error);
   EXPECT_THROW(makeBundle(root.path(), root.path() / "b",
                           {.identifier = "x", .name = "../x", .version = "1"}),
                std::runtime_error);
   fs::create_directory_symlink(outside.path(), root.path() / "link");
-  EXPECT_THROW(makeBundle(root.path(), root.path() / "link", spec), std::runtime_error);
+  EXPECT_THROW(makeBundle(root.path(), root.path() / "link", facts), std::runtime_error);
   EXPECT_TRUE(fs::is_empty(outside.path()));
   fs::create_symlink(outside.path(), bundle / "escape");
   EXPECT_THROW(zipBundle(root.path(), bundle, root.path() / "Again.zip"), std::runtime_error);

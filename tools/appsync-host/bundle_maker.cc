@@ -68,13 +68,13 @@ plist::Bytes iconPng(const std::string& identifier) {
   return std::move(*png);
 }
 
-plist::Dict infoPlist(const BundleSpec& spec) {
+plist::Dict infoPlist(const BundleFacts& facts) {
   plist::Dict info;
-  info.set(std::string(kBNBundleIdentifierKey), spec.identifier);
-  info.set(std::string(kBNBundleVersionKey), spec.version);
-  info.set(std::string(_kBNBundleDisplayNameKey), spec.name);
-  if (spec.withIcon) info.set(std::string(_kBNBundleIconFileKey), std::string(kIconFileName));
-  for (const auto& [key, value] : spec.extraInfo) info.set(key, value);
+  info.set(std::string(kBNBundleIdentifierKey), facts.identifier);
+  info.set(std::string(kBNBundleVersionKey), facts.version);
+  info.set(std::string(_kBNBundleDisplayNameKey), facts.name);
+  if (facts.withIcon) info.set(std::string(_kBNBundleIconFileKey), std::string(kIconFileName));
+  for (const auto& [key, value] : facts.extraInfo) info.set(key, value);
   return info;
 }
 
@@ -127,19 +127,19 @@ plist::Bytes sourceBytes(zip_source_t* source, const fs::path& zipPath) {
 
 }  // namespace
 
-fs::path makeBundle(const fs::path& root, const fs::path& directory, const BundleSpec& spec) {
-  if (!isPlainName(spec.name)) {
-    throw std::runtime_error("\"" + spec.name + "\" cannot name a bundle folder");
+fs::path makeBundle(const fs::path& root, const fs::path& directory, const BundleFacts& facts) {
+  if (!isPlainName(facts.name)) {
+    throw std::runtime_error("\"" + facts.name + "\" cannot name a bundle folder");
   }
-  const fs::path bundle = (directory / (spec.name + ".app")).lexically_normal();
+  const fs::path bundle = (directory / (facts.name + ".app")).lexically_normal();
   requireUnder(root, bundle);
   makeDeviceDirectory(root, directory);
   // An earlier bundle of that name is replaced as a whole (a link there is removed, not followed).
   std::error_code ec;
   fs::remove_all(bundle, ec);
   if (ec) throw std::runtime_error("cannot replace " + bundle.string() + ": " + ec.message());
-  writeDevicePlist(root, bundle / "Info.plist", infoPlist(spec), /*xml=*/true);
-  if (spec.withIcon) writeDeviceFile(root, bundle / kIconFileName, iconPng(spec.identifier));
+  writeDevicePlist(root, bundle / "Info.plist", infoPlist(facts), /*xml=*/true);
+  if (facts.withIcon) writeDeviceFile(root, bundle / kIconFileName, iconPng(facts.identifier));
   return bundle;
 }
 

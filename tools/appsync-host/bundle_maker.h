@@ -10,7 +10,7 @@
 
 namespace appsync::host {
 
-struct BundleSpec {
+struct BundleFacts {
   std::string identifier;
   std::string name;     // the bundle's display name; also NAME of NAME.app
   std::string version;  // BNBundleVersion
@@ -23,7 +23,7 @@ struct BundleSpec {
 // "BNBundleDisplayName", "BNBundleIconFile") and a PNG icon of a colour derived from the
 // identifier. Returns the bundle's path. `root` is the device root: nothing is written outside.
 std::filesystem::path makeBundle(const std::filesystem::path& root,
-                                 const std::filesystem::path& directory, const BundleSpec& spec);
+                                 const std::filesystem::path& directory, const BundleFacts& facts);
 // Packs a bundle folder into the zip archive `zipPath` (the folder NAME.app at the archive's top).
 void zipBundle(const std::filesystem::path& root, const std::filesystem::path& bundle,
                const std::filesystem::path& zipPath);

@@ -20,8 +20,9 @@ class DeviceSession {
  public:
   // The device's directory of saved fake state, and its log files.
   static std::filesystem::path stateDirectory(const std::filesystem::path& root);
-  static std::filesystem::path logFile(const std::filesystem::path& root);          // appsync.log
-  static std::filesystem::path transactionFile(const std::filesystem::path& root);  // transactions.log
+  static std::filesystem::path logFile(const std::filesystem::path& root);  // appsync.log
+  static std::filesystem::path transactionFile(
+      const std::filesystem::path& root);  // transactions.log
 
   // Opens the device at `root` and loads it. InputError when root holds no device or its state
   // is malformed (naming the file and field); DeviceBusy when another command holds it.

@@ -20,7 +20,7 @@ inline constexpr const char* kSyncNotificationName = "com.vantor.pavilion.trc.ws
 // `logFile` is the device's log (ROOT/appsync.log); `logLines` is how many of the last lines of
 // it and of the transaction log to include.
 nlohmann::ordered_json collectDevice(FakePlatform& device, const std::filesystem::path& logFile,
-                             std::size_t logLines);
+                                     std::size_t logLines);
 
 // The last `count` lines of the text file at `path` (fewer when it has fewer; none when it is
 // missing), without their line breaks.

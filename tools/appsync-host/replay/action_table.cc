@@ -8,13 +8,13 @@
 
 namespace appsync::host::replay {
 
-ActionResult runFromTable(StepContext& context, std::span<const ActionSpec> table) {
+ActionResult runFromTable(StepContext& context, std::span<const ActionEntry> table) {
   const std::string name = context.value.string();
-  const ActionSpec* found = nullptr;
+  const ActionEntry* found = nullptr;
   std::vector<std::string> known;
-  for (const ActionSpec& spec : table) {
-    if (spec.name == name) found = &spec;
-    known.emplace_back(spec.name);
+  for (const ActionEntry& entry : table) {
+    if (entry.name == name) found = &entry;
+    known.emplace_back(entry.name);
   }
   if (!found) {
     context.value.fail("unknown " + context.selector + " \"" + name +

@@ -17,7 +17,7 @@
 
 namespace appsync::host::replay {
 
-struct ActionSpec {
+struct ActionEntry {
   std::string_view name;
   // The action's own fields; the action key and kStepKeys are always allowed.
   std::vector<std::string_view> fields;
@@ -27,7 +27,7 @@ struct ActionSpec {
 // Looks the action's name (the selector's value) up in `table`, checks the step's fields and
 // runs the action. An unknown name is an InputError listing the known ones; a failure of the
 // work itself (a file that cannot be written) becomes StepFailed.
-ActionResult runFromTable(StepContext& context, std::span<const ActionSpec> table);
+ActionResult runFromTable(StepContext& context, std::span<const ActionEntry> table);
 
 // "a, b, c": for messages that list what is allowed.
 std::string joinNames(const std::vector<std::string>& names);

@@ -382,9 +382,9 @@ const std::vector<HostCall>& hostCalls() {
   return calls;
 }
 
-const std::vector<ActionSpec>& callTable() {
-  static const std::vector<ActionSpec> table = [] {
-    std::vector<ActionSpec> specs;
+const std::vector<ActionEntry>& callTable() {
+  static const std::vector<ActionEntry> table = [] {
+    std::vector<ActionEntry> specs;
     specs.push_back({"supportedDataclasses", {}, [](StepContext& s) -> ActionResult {
                        std::vector<std::string> names = s.session.client().supportedDataclasses();
                        return plist::Value(plist::Array(names.begin(), names.end()));

@@ -92,12 +92,12 @@ ActionResult stageApp(StepContext& s) {
 
 // A bundle NAME.app (folder) or NAME.zip in the public staging folder; the result is its path.
 ActionResult stagePackage(StepContext& s) {
-  BundleSpec spec;
-  spec.identifier = s.step["identifier"].string();
-  spec.name = s.step["name"].string();
-  spec.version = packageVersion(s);
-  if (auto info = s.step.optional("info")) spec.extraInfo = readDict(*info);
-  if (auto icon = s.step.optional("icon")) spec.withIcon = icon->boolean();
+  BundleFacts facts;
+  facts.identifier = s.step["identifier"].string();
+  facts.name = s.step["name"].string();
+  facts.version = packageVersion(s);
+  if (auto info = s.step.optional("info")) facts.extraInfo = readDict(*info);
+  if (auto icon = s.step.optional("icon")) facts.withIcon = icon->boolean();
 
   const auto asField = s.step.optional("as");
   const auto fileField = s.step.optional("file");
@@ -118,10 +118,10 @@ ActionResult stagePackage(StepContext& s) {
   const fs::path& root = s.session.root();
   const fs::path staging = fixedPath(s, s.session.paths().publicStaging(), s.value);
   const fs::path target =
-      fileField ? devicePath(staging, *fileField) : staging / (spec.name + wanted);
+      fileField ? devicePath(staging, *fileField) : staging / (facts.name + wanted);
   makeDeviceDirectory(root, target.parent_path());
   ScratchDirectory scratch(root);
-  const fs::path bundle = makeBundle(root, scratch.path(), spec);
+  const fs::path bundle = makeBundle(root, scratch.path(), facts);
   std::error_code ec;
   fs::remove_all(target, ec);  // a package staged before under that name is replaced
   if (kind == "zip") {
@@ -163,8 +163,8 @@ ActionResult makeReadOnly(StepContext& s) {
   return std::nullopt;
 }
 
-const std::vector<ActionSpec>& stageTable() {
-  static const std::vector<ActionSpec> table = {
+const std::vector<ActionEntry>& stageTable() {
+  static const std::vector<ActionEntry> table = {
       {"todo",
        {"list"},
        [](StepContext& s) {

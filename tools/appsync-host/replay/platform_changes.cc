@@ -119,21 +119,21 @@ ActionResult setRestriction(StepContext& s) {
 // registry's own package install, which records it, copies it into its container and tells the
 // registry's observers.
 ActionResult installApp(StepContext& s) {
-  BundleSpec spec;
-  spec.identifier = s.step["identifier"].string();
-  spec.name = s.step["name"].string();
+  BundleFacts facts;
+  facts.identifier = s.step["identifier"].string();
+  facts.name = s.step["name"].string();
   auto version = s.step.optional("version");
-  spec.version = version ? version->string() : "1.0";
+  facts.version = version ? version->string() : "1.0";
   plist::Dict options{{std::string(ARPackageTypeKey), std::string(ARPackageTypeCustomer)},
-                      {"BNBundleIdentifier", spec.identifier}};
+                      {"BNBundleIdentifier", facts.identifier}};
   if (auto metadata = s.step.optional("storeMetadata")) {
     options.set(std::string(ARCaravelMetadataKey), readDataOrPlist(*metadata));
   }
   ScratchDirectory scratch(s.session.root());
-  const auto bundle = makeBundle(s.session.root(), scratch.path(), spec);
+  const auto bundle = makeBundle(s.session.root(), scratch.path(), facts);
   ErrorRef error;
   if (!s.session.device().ar().installApplication(bundle.string(), options, &error)) {
-    throw StepFailed("the registry did not install " + spec.identifier + ": " +
+    throw StepFailed("the registry did not install " + facts.identifier + ": " +
                      (error ? error->describe() : std::string("no reason given")));
   }
   return std::nullopt;
@@ -163,8 +163,8 @@ ActionResult backupData(StepContext& s) {
   return std::nullopt;
 }
 
-const std::vector<ActionSpec>& platformTable() {
-  static const std::vector<ActionSpec> table = {
+const std::vector<ActionEntry>& platformTable() {
+  static const std::vector<ActionEntry> table = {
       {"fail", {"service", "operation", "times", "error"}, scriptFailure},
       {"succeed", {"service", "operation"}, scriptSuccess},
       {"deny-assertions", {"app", "times", "outcome"}, denyAssertions},

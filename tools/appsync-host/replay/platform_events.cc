@@ -84,8 +84,8 @@ ActionResult postStartup(StepContext& s) {
       plist::Dict{{"coordinationObserver", client.hasInstallCoordinatorObserver()}});
 }
 
-const std::vector<ActionSpec>& eventTable() {
-  static const std::vector<ActionSpec> table = {
+const std::vector<ActionEntry>& eventTable() {
+  static const std::vector<ActionEntry> table = {
       {"startup", {}, postStartup},
       {"installs-prioritized",
        {"prioritized", "paused"},

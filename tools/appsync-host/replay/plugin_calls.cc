@@ -43,8 +43,8 @@ plist::Dict orderCandidates(const YamlField& field) {
   return items;
 }
 
-const std::vector<ActionSpec>& pluginTable() {
-  static const std::vector<ActionSpec> table = {
+const std::vector<ActionEntry>& pluginTable() {
+  static const std::vector<ActionEntry> table = {
       {"changeAssetID",
        {"app", "state"},
        [](StepContext& s) -> ActionResult {

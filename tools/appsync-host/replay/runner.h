@@ -3,14 +3,13 @@
 #pragma once
 
 #include <atomic>
-#include <optional>
-
 #include <cstddef>
 #include <exception>
 #include <filesystem>
 #include <functional>
 #include <map>
 #include <memory>
+#include <optional>
 #include <ostream>
 #include <string>
 #include <thread>
