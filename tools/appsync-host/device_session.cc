@@ -3,7 +3,9 @@
 
 #include <cstdio>
 #include <exception>
+#include <string_view>
 #include <utility>
+#include <vector>
 
 #include "input_error.h"
 #include "platform/fake/state_fields.h"
@@ -29,14 +31,21 @@ class DeviceLogSink : public LogSink {
   FileLogSink file_;
 };
 
+// The fakes that deliver on a callback thread of their own, by the names scripts use for them.
+// Install coordination delivers too, through its own service calls.
+std::vector<std::pair<std::string_view, CallbackThread*>> callbackThreads(FakePlatform& device) {
+  return {{"registry", &device.ar().callbackThread()},
+          {"notifications", &device.system().callbackThread()},
+          {"host", &device.tr().deviceService().callbackThread()},
+          {"store", &device.bz().callbackThread()}};
+}
+
 // Drains every fake that delivers on a thread of its own, except those whose deliveries a script
 // holds back (unless `releaseHeld`: then they are let go first). True when one of the drained
 // ones still had something queued.
 bool settleOnce(FakePlatform& device, bool releaseHeld) {
   bool busy = false;
-  for (CallbackThread* thread :
-       {&device.ar().callbackThread(), &device.system().callbackThread(),
-        &device.tr().deviceService().callbackThread(), &device.bz().callbackThread()}) {
+  for (const auto& [name, thread] : callbackThreads(device)) {
     if (releaseHeld) thread->release();
     if (thread->isHeld()) continue;
     busy = busy || thread->pendingCount() > 0;
@@ -192,16 +201,24 @@ void DeviceSession::settle() { settle(false); }
 
 std::vector<std::string> DeviceSession::heldServices() {
   std::vector<std::string> held;
-  const std::pair<const char*, CallbackThread*> threads[] = {
-      {"registry", &device_->ar().callbackThread()},
-      {"notifications", &device_->system().callbackThread()},
-      {"host", &device_->tr().deviceService().callbackThread()},
-      {"store", &device_->bz().callbackThread()}};
-  for (const auto& [name, thread] : threads) {
+  for (const auto& [name, thread] : callbackThreads(*device_)) {
     if (thread->isHeld()) held.emplace_back(name);
   }
   if (device_->kc().isHeld()) held.emplace_back("coordination");
   return held;
+}
+
+bool DeviceSession::holdService(std::string_view name, bool hold) {
+  if (name == "coordination") {
+    hold ? device_->kc().hold() : device_->kc().release();
+    return true;
+  }
+  for (const auto& [service, thread] : callbackThreads(*device_)) {
+    if (service != name) continue;
+    hold ? thread->hold() : thread->release();
+    return true;
+  }
+  return false;
 }
 
 void DeviceSession::settle(bool releaseHeld) {

@@ -7,6 +7,7 @@
 #include <memory>
 #include <mutex>
 #include <string>
+#include <string_view>
 #include <vector>
 
 #include "client/apps_client.h"
@@ -52,6 +53,9 @@ class DeviceSession {
   // The services whose deliveries a script holds back now ("registry", "coordination",
   // "notifications", "host", "store").
   std::vector<std::string> heldServices();
+  // Holds back, or lets go, the deliveries of the service a script names ("registry",
+  // "coordination", "notifications", "host", "store"); false for any other name.
+  bool holdService(std::string_view name, bool hold);
   // Lets every held service go and settles.
   void releaseHeld() { settle(true); }
   // Releases every held service and settles, releases the client (which waits for its own

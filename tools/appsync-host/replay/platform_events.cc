@@ -52,21 +52,10 @@ std::shared_ptr<KCPromise> promiseOf(StepContext& s) {
 void holdOrRelease(StepContext& s, bool hold) {
   const YamlField field = s.step["service"];
   const std::string name = field.string();
-  FakePlatform& device = s.session.device();
-  if (name == "coordination") {
-    hold ? device.kc().hold() : device.kc().release();
-    return;
-  }
-  CallbackThread* thread = nullptr;
-  if (name == "registry") thread = &device.ar().callbackThread();
-  if (name == "notifications") thread = &device.system().callbackThread();
-  if (name == "store") thread = &device.bz().callbackThread();
-  if (name == "host") thread = &device.tr().deviceService().callbackThread();
-  if (!thread) {
+  if (!s.session.holdService(name, hold)) {
     field.fail("unknown service \"" + name +
                "\" (expected one of: registry, coordination, notifications, store, host)");
   }
-  hold ? thread->hold() : thread->release();
 }
 
 ActionResult postStartup(StepContext& s) {
