@@ -129,6 +129,63 @@ class AppsClient : public TRClient,
   // The sync road: a placeholder for an asset the host is about to send.
   void _createPlaceHolderApplication(const std::shared_ptr<TRAsset>& asset);
 
+  // ---- Coordinators and promises (coordination/coordinators.cc, promises.cc) -----------------
+  // Everything below is made, looked up and cancelled under kAppSyncCoordinationClient, on the
+  // caller's thread; the caller owns what is returned. Null means nothing could be had.
+  //
+  // The updating (existingApp) or initiating coordinator of `bundleID`, found or created. One
+  // made by another client is refused (null). *error (when given) receives the service's error,
+  // which may be null also when the result is.
+  std::shared_ptr<KCAppInstallCoordinator>
+  _initiatingOrUpdatingAppInstallCoordinatorForBundleIdentifier(const std::string& bundleID,
+                                                                bool existingApp,
+                                                                bool createIfNotExisting,
+                                                                ErrorRef* error);
+  // A new, unconfigured placeholder.
+  std::shared_ptr<KCPlaceholder> _placeHolderForBundleIdentifier(const std::string& bundleID,
+                                                                 const std::string& name,
+                                                                 std::uint64_t installType);
+  // The complete icon promise "ID-Icon" for the file at `transferPath`, attached to
+  // `andAddToPlaceHolder`; cancelled (30 for an app install, 29 for a restore) when it cannot
+  // be attached.
+  std::shared_ptr<KCPromisedTransferToPath> _createIconPromiseForBundleIdentifier(
+      const std::string& bundleID, const std::string& transferPath,
+      std::uint64_t diskSpaceNeeded, const std::shared_ptr<KCPlaceholder>& andAddToPlaceHolder,
+      bool forAppInstall);
+  // The incomplete asset promise "ID-Asset" (with a transfer path when `atPath` is given),
+  // attached to the coordinator; cancelled with 30 when it cannot be attached.
+  std::shared_ptr<KCPromisedTransferToPath> _createAppAssetPromiseForBundleIdentifier(
+      const std::string& bundleID, const std::optional<std::string>& atPath,
+      const std::shared_ptr<KCAppInstallCoordinator>& andAddToCoordinatinator);
+  // A complete user-data promise "ID-UserData", attached to nothing.
+  std::shared_ptr<KCPromisedOutOfBandTransfer> _userDataPromiseForBundleIdentifier(
+      const std::string& bundleID);
+  // A restore placeholder, configured to completion from the store metadata, SINF and icon;
+  // its directory and icon file are written first and stay on disk whatever happens. Cancelled
+  // with 29 when a configuration step fails.
+  std::shared_ptr<KCPlaceholder> _placeHolderForBundleIdentifier(
+      const std::string& bundleID, const plist::Dict& withCaravelMetadata,
+      const std::optional<plist::Bytes>& sinfData, const std::optional<plist::Bytes>& iconData,
+      std::uint64_t demotionStatus);
+
+  // ---- Coordinated sync install (coordination/coordinated_install.cc) -------------------------
+  // Readies a coordinator for a package the host is about to send: install options, SPR
+  // promises, an asset promise without a path and a placeholder. False means the package must
+  // not be requested; what this run obtained is then cancelled.
+  bool prepareAppForInstallUsingCoordination(const std::shared_ptr<TRAsset>& asset,
+                                             bool existingApp);
+  // Moves the asset promise along with the host's download progress. False when there is no
+  // usable coordinator or the promise is already complete.
+  bool updateTransferProgressForApp(const std::shared_ptr<TRAsset>& asset, bool existingApp);
+  // Completes the asset promise with the delivered package, or cancels the coordinator with
+  // the transfer's error.
+  void transferCompleteForApp(const std::shared_ptr<TRAsset>& asset, const ErrorRef& withError,
+                              bool isExistingApp);
+  // After an unsuccessful asset sync, cancels the coordinator of every outstanding item.
+  void assetSyncFinishedWithStatus(bool status, const std::set<std::string>& outstandingItems);
+  // Asks the service to remove the application; returns at once, the outcome is only logged.
+  void uninstallAppUsingCoordination(const std::string& bundleID);
+
   // ---- Placeholder lookup (restore/placeholder_lookup.cc) -------------------------------------
   using ProxyBlock =
       std::function<void(const std::shared_ptr<const ARApplicationProxy>& proxy, bool* stop)>;
