@@ -1,8 +1,6 @@
 // The fake install-coordination daemon's installs: a coordinator's placeholder and then its
 // package go into the registry as its promises are fulfilled; a cancelled coordinator's
 // placeholder record comes out again; uninstalls.
-#include "platform/fake/fake_kc_daemon.h"
-
 #include <optional>
 #include <string>
 #include <utility>
@@ -10,6 +8,7 @@
 #include "platform/ar.h"
 #include "platform/bundle_keys.h"
 #include "platform/fake/fake_ar.h"
+#include "platform/fake/fake_kc_daemon.h"
 #include "platform/fake/fake_kc_errors.h"
 
 namespace appsync {
@@ -40,7 +39,7 @@ void FakeKCDaemon::evaluate(const CoordinatorRef& c) {
     if (!placeholder->isReadyToInstall()) return;
     if (ErrorRef failure = scriptedFailure(kInstallPlaceholderOp)) {
       if (c->markCancelled(failure)) {
-        forget(c);
+        retire(c, kServiceClient);
         reportCancellation(c, failure, kServiceClient);
       }
       return;
@@ -64,6 +63,13 @@ void FakeKCDaemon::evaluate(const CoordinatorRef& c) {
   plist::Dict options{{std::string(ARPackageTypeKey), std::string(ARPackageTypeCustomer)},
                       {std::string(kBNBundleIdentifierKey), c->bundleID()},
                       {std::string(ARInstallTypeKey), installType}};
+  std::shared_ptr<const EMStoreMetadata> metadata =
+      s.installOptions && s.installOptions->caravelMetadata() ? s.installOptions->caravelMetadata()
+                                                              : placeholder->metadata();
+  if (metadata) options.set(std::string(ARCaravelMetadataKey), metadata->dictionary());
+  if (std::optional<plist::Bytes> sinf = placeholder->sinfData()) {
+    options.set(std::string(ARApplicationSINFKey), std::move(*sinf));
+  }
   ErrorRef failure = scriptedFailure(kInstallPackageOp);
   if (!failure) {
     ErrorRef registryError;
@@ -76,7 +82,7 @@ void FakeKCDaemon::evaluate(const CoordinatorRef& c) {
     }
   }
   if (!c->finish(failure)) return;
-  forget(c);
+  retire(c, std::nullopt);
   deliver(*c, [&](KCAppInstallObserverDelegate& d) { d.coordinatorDidCompleteSuccessfully(c); });
 }
 
@@ -89,6 +95,8 @@ void FakeKCDaemon::putPlaceholderRecord(Coordinator& c, const FakeKCPlaceholder&
   record.name = placeholder.bundleName();
   record.installType = placeholder.installType();
   record.isPlaceholder = true;
+  std::optional<plist::Bytes> sinf = placeholder.sinfData();
+  record.hasMIDBasedSINF = sinf && !sinf->empty();
   if (std::optional<KCPlaceholderAttributes> attributes = placeholder.attributes()) {
     record.version = attributes->bundleVersion();
     if (!record.version) {

@@ -7,8 +7,8 @@
 #include <string_view>
 #include <utility>
 
-#include "runtime/error.h"
 #include "platform/fake/fake_kc_service_hooks.h"
+#include "runtime/error.h"
 
 namespace appsync::fake_kc {
 
