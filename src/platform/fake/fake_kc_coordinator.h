@@ -10,11 +10,11 @@
 #include <type_traits>
 #include <vector>
 
+#include "runtime/error.h"
+#include "runtime/guarded.h"
 #include "platform/em.h"
 #include "platform/fake/fake_kc_service_hooks.h"
 #include "platform/kc.h"
-#include "runtime/error.h"
-#include "runtime/guarded.h"
 
 namespace appsync {
 

@@ -7,8 +7,8 @@
 #include <string_view>
 #include <utility>
 
-#include "platform/fake/fake_kc_service_hooks.h"
 #include "runtime/error.h"
+#include "platform/fake/fake_kc_service_hooks.h"
 
 namespace appsync::fake_kc {
 

@@ -9,12 +9,12 @@
 #include <string>
 #include <string_view>
 
-#include "platform/em.h"
-#include "platform/fake/fake_kc_service_hooks.h"
-#include "platform/kc.h"
 #include "runtime/error.h"
 #include "runtime/guarded.h"
 #include "runtime/plist/value.h"
+#include "platform/em.h"
+#include "platform/fake/fake_kc_service_hooks.h"
+#include "platform/kc.h"
 
 namespace appsync {
 

@@ -9,10 +9,10 @@
 #include <string>
 #include <string_view>
 
-#include "platform/fake/fake_kc_service_hooks.h"
-#include "platform/kc.h"
 #include "runtime/error.h"
 #include "runtime/guarded.h"
+#include "platform/fake/fake_kc_service_hooks.h"
+#include "platform/kc.h"
 
 namespace appsync {
 
