@@ -1,13 +1,14 @@
 // The fake application registry's installs and uninstalls: placeholder and package installs
 // into containers under the device root, removal, the calls made, and the events they cause.
+#include "platform/fake/fake_ar.h"
+
 #include <system_error>
 #include <utility>
 
+#include "runtime/fs/files.h"
 #include "platform/bundle_keys.h"
-#include "platform/fake/fake_ar.h"
 #include "platform/fake/fake_ar_bundle_files.h"
 #include "platform/fake/fake_ar_package_archive.h"
-#include "runtime/fs/files.h"
 
 namespace appsync {
 

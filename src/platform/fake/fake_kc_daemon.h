@@ -14,12 +14,12 @@
 #include <string_view>
 #include <vector>
 
+#include "runtime/error.h"
+#include "runtime/guarded.h"
 #include "platform/fake/callback_thread.h"
 #include "platform/fake/fake_kc_history.h"
 #include "platform/fake/fake_kc_objects.h"
 #include "platform/kc.h"
-#include "runtime/error.h"
-#include "runtime/guarded.h"
 
 namespace appsync {
 

@@ -1,6 +1,8 @@
 // The fake install-coordination daemon's installs: a coordinator's placeholder and then its
 // package go into the registry as its promises are fulfilled; a cancelled coordinator's
 // placeholder record comes out again; uninstalls.
+#include "platform/fake/fake_kc_daemon.h"
+
 #include <optional>
 #include <string>
 #include <utility>
@@ -8,7 +10,6 @@
 #include "platform/ar.h"
 #include "platform/bundle_keys.h"
 #include "platform/fake/fake_ar.h"
-#include "platform/fake/fake_kc_daemon.h"
 #include "platform/fake/fake_kc_errors.h"
 
 namespace appsync {
