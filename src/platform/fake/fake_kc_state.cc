@@ -260,7 +260,7 @@ FinishedCoordinator finishedFrom(const StateFields& f) {
     f.fail("state", "expected completed or cancelled");
   if (finished.errorDomain.has_value() != finished.errorCode.has_value()) {
     f.fail(finished.errorDomain ? "errorCode" : "errorDomain",
-           "expected with errorDomain and errorCode both present");
+           "missing (an error has both a domain and a code)");
   }
   return finished;
 }
