@@ -184,6 +184,27 @@ std::string rowOf(const std::string& table, const std::string& first) {
   return table.substr(at + 1, table.find('\n', at + 1) - at - 1);
 }
 
+TEST_F(ShowViewTest, FinishedCoordinatorsAreListedWithTheirOutcome) {
+  FakeKCInstallCoordination& kc = device_.kc();
+  EXPECT_EQ(renderDeviceTable(collect(), false).find("Finished coordinators"), std::string::npos);
+  kc.putCoordinator(KCCoordinatorKind::Updating, "com.c", 7)
+      ->cancelForReason(makeError("Test", 5, "no"), 1, nullptr);
+  kc.putCoordinator(KCCoordinatorKind::Restoring, "com.d", 7)->cancelForReason(nullptr, 0, nullptr);
+  kc.drain();
+
+  const json view = collect();
+  EXPECT_EQ(view["finishedCoordinators"],
+            json::parse(R"([{"bundleID": "com.c", "kind": "Updating", "state": "cancelled",
+                             "errorDomain": "Test", "errorCode": 5, "cancellingClient": 1},
+                            {"bundleID": "com.d", "kind": "Restoring", "state": "cancelled",
+                             "errorDomain": "KCErrorDomain", "errorCode": 10,
+                             "cancellingClient": 0}])"));
+  const std::string table = renderDeviceTable(view, false);
+  EXPECT_NE(table.find("Finished coordinators (2)"), std::string::npos) << table;
+  EXPECT_NE(rowOf(table, "com.c").find(" Updating "), std::string::npos) << table;
+  EXPECT_NE(rowOf(table, "com.c").find(" cancelled  Test 5 "), std::string::npos) << table;
+}
+
 TEST_F(ShowViewTest, AnUnusableTodoListIsReportedNotLogged) {
   for (const char* text : {"<plist><array><string>broken", "<plist><dict/></plist>"}) {
     put(device_.paths().todoList(), text);

@@ -149,6 +149,20 @@ void coordinationSection(Sections& out, const json& coordinators) {
   out.table(promises);
 }
 
+void finishedCoordinatorsSection(Sections& out, const json& finished) {
+  if (finished.empty()) return;
+  out.heading(counted("Finished coordinators", finished));
+  TableText table({"BUNDLE", "KIND", "STATE", "ERROR", "CANCELLED BY"});
+  for (const json& f : finished) {
+    const std::string error = f.at("errorDomain").is_null() ? "-"
+                                                            : cellText(f.at("errorDomain")) + " " +
+                                                                  cellText(f.at("errorCode"));
+    table.add({cellText(f.at("bundleID")), cellText(f.at("kind")), cellText(f.at("state")), error,
+               cellText(f.at("cancellingClient"))});
+  }
+  out.table(table);
+}
+
 void todoSection(Sections& out, const json& todo) {
   const json& records = todo.at("records");
   out.heading(counted("Todo list", records));
@@ -238,6 +252,7 @@ std::string renderDeviceTable(const nlohmann::ordered_json& view, bool styled) {
   out.heading("Device " + cellText(view.at("root")));
   registrySection(out, view.at("registry"), cellText(view.at("root")));
   coordinationSection(out, view.at("coordinators"));
+  finishedCoordinatorsSection(out, view.at("finishedCoordinators"));
   todoSection(out, view.at("todoList"));
   restoreSection(out, view.at("restore"));
   homeScreenSection(out, view.at("homeScreen"));

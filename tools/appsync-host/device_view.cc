@@ -145,6 +145,20 @@ json coordinatorsJson(const FakeKCInstallCoordination& coordination) {
   return coordinators;
 }
 
+// What became of the coordinators the service has finished, oldest first.
+json finishedCoordinatorsJson(const FakeKCInstallCoordination& coordination) {
+  json finished = json::array();
+  for (const FinishedCoordinator& f : coordination.finishedCoordinators()) {
+    finished.push_back({{"bundleID", f.bundleID},
+                        {"kind", coordinatorKindName(f.kind)},
+                        {"state", coordinatorStateName(f.state)},
+                        {"errorDomain", optionalJson(f.errorDomain)},
+                        {"errorCode", optionalJson(f.errorCode)},
+                        {"cancellingClient", optionalJson(f.cancellingClient)}});
+  }
+  return finished;
+}
+
 bool isMissingFile(const ErrorRef& error) {
   return error && error->domain == kPOSIXErrorDomain && error->code == ENOENT;
 }
@@ -297,6 +311,7 @@ nlohmann::ordered_json collectDevice(FakePlatform& device, const std::filesystem
   return {{"root", root.lexically_normal().string()},
           {"registry", registryJson(device.ar())},
           {"coordinators", coordinatorsJson(device.kc())},
+          {"finishedCoordinators", finishedCoordinatorsJson(device.kc())},
           {"todoList", todoListJson(device.paths().todoList())},
           {"restore", restoreJson(device.paths())},
           {"homeScreen", homeScreenJson(device)},

@@ -93,6 +93,11 @@ void FakeARWorkspace::setUninstallHook(std::function<void(const std::string&)> h
   uninstallHook_ = std::move(hook);
 }
 
+void FakeARWorkspace::setArchiveLimits(fake_ar::ArchiveLimits limits) {
+  std::lock_guard lock(mutex_);
+  archiveLimits_ = limits;
+}
+
 std::optional<std::string> FakeARWorkspace::containerDirectoryFor(
     const std::string& identifier) const {
   // One directory per application, directly below the base.

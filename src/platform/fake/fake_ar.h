@@ -17,6 +17,7 @@
 
 #include "platform/ar.h"
 #include "platform/fake/callback_thread.h"
+#include "platform/fake/fake_ar_package_archive.h"
 #include "platform/fake/fake_service.h"
 #include "platform/fake/state_fields.h"
 
@@ -42,7 +43,8 @@ namespace appsync {
 //   found.
 // - A placeholder install over an installed application turns the record into a placeholder
 //   (keeping its container) until a package install replaces it.
-// - A package is copied into ROOT/private/var/containers/Bundle/Application/ID/NAME.app, which
+// - A package (a bundle folder, or the one in a zip archive) is copied into
+//   ROOT/private/var/containers/Bundle/Application/ID/NAME.app, which
 //   replaces any earlier bundle in that container and keeps the container's other files (the
 //   store metadata). Uninstalling removes the container.
 // - Install options carrying store metadata (ARCaravelMetadataKey, bytes of a property list)
@@ -103,6 +105,9 @@ class FakeARWorkspace final : public ARApplicationWorkspace, public FakeService 
   // Removes a record without events or files touched. False when there was none.
   bool removeApplication(const std::string& identifier);
 
+  // Bounds of a zip package (defaults in ArchiveLimits: 1 GiB unpacked, 65,536 entries).
+  void setArchiveLimits(fake_ar::ArchiveLimits limits);
+
   // Called with the identifier after every successful uninstall, outside the registry's lock.
   void setUninstallHook(std::function<void(const std::string&)> hook);
 
@@ -151,8 +156,15 @@ class FakeARWorkspace final : public ARApplicationWorkspace, public FakeService 
   // "BNBundleVersion", "BNBundleDisplayName", "BNBundleIconFile"); options must have
   // PackageType "Placeholder", may have "BNBundleIdentifier" (must agree) and "ARInstallType".
   bool installApplication(const std::string& path, const plist::Dict& options) override;
-  // Package install: PATH is a bundle directory with an Info.plist whose identifier agrees with
-  // options "BNBundleIdentifier". Errors are of the domain "AppRegistryError".
+  // Package install: PATH is a bundle folder NAME.app, or a zip archive NAME.zip holding exactly
+  // one top-level bundle folder, with an Info.plist whose identifier agrees with options
+  // "BNBundleIdentifier". An archive is unpacked into a scratch folder in the application's
+  // container, which is removed again whatever happens; an archive that is unreadable, holds
+  // links, names leading out of the scratch folder, no bundle or several, or exceeds the archive
+  // limits is refused as a bad package with nothing written. Non-empty bytes under
+  // "ApplicationSINF" mark the record hasMIDBasedSINF, empty ones clear it, and without them an
+  // existing record keeps its mark. Errors are of the domain "AppRegistryError" (bad package: 2,
+  // identifier mismatch: 3, file operation: 4).
   bool installApplication(const std::string& path, const plist::Dict& options,
                           ErrorRef* error) override;
   void enumerateBundlesOfType(int type, const BundleBlock& block) override;
@@ -206,6 +218,11 @@ class FakeARWorkspace final : public ARApplicationWorkspace, public FakeService 
 
   bool installPlaceholder(const std::string& path, const plist::Dict& options);
   bool installPackage(const std::string& path, const plist::Dict& options, ErrorRef* error);
+  // A zip package, unpacked into a scratch folder in the application's container.
+  bool installArchive(const std::string& path, const plist::Dict& options, ErrorRef* error);
+  // Installs the bundle folder `bundle`; errors name `path`, the package as given.
+  bool installBundle(const std::string& bundle, const std::string& path, const plist::Dict& options,
+                     ErrorRef* error);
   void recordInstall(const std::string& path, const plist::Dict& options, bool placeholder,
                      bool succeeded);
 
@@ -221,6 +238,7 @@ class FakeARWorkspace final : public ARApplicationWorkspace, public FakeService 
   std::vector<std::pair<std::uint64_t, ARApplicationWorkspaceObserverProtocol*>> observers_;
   std::uint64_t nextRegistration_ = 1;
   std::function<void(const std::string&)> uninstallHook_;
+  fake_ar::ArchiveLimits archiveLimits_;
   CallbackThread callbacks_{"fake-ar-events"};  // last: stops first
 };
 

@@ -8,6 +8,7 @@
 #include "runtime/fs/files.h"
 #include "platform/bundle_keys.h"
 #include "platform/fake/fake_ar_bundle_files.h"
+#include "platform/fake/fake_ar_package_archive.h"
 
 namespace appsync {
 
@@ -21,6 +22,9 @@ namespace {
 constexpr std::int64_t kErrorBadPackage = 2;
 constexpr std::int64_t kErrorIdentifierMismatch = 3;
 constexpr std::int64_t kErrorFileOperation = 4;
+
+// Where a zip package is unpacked, inside the application's container, for the install only.
+constexpr std::string_view kUnpackFolderName = ".package-unpack";
 
 ErrorRef registryError(std::int64_t code, const std::string& description, const std::string& path) {
   return makeError(kAppRegistryErrorDomain, code, description, path);
@@ -132,11 +136,53 @@ bool FakeARWorkspace::installPlaceholder(const std::string& path, const plist::D
 
 bool FakeARWorkspace::installPackage(const std::string& path, const plist::Dict& options,
                                      ErrorRef* error) {
-  std::string bundlePath = path;
+  if (fake_ar::isPackageArchive(path)) return installArchive(path, options, error);
+  return installBundle(path, path, options, error);
+}
+
+bool FakeARWorkspace::installArchive(const std::string& path, const plist::Dict& options,
+                                     ErrorRef* error) {
+  const std::string* requested = plist::stringAt(options, kBNBundleIdentifierKey);
+  if (!requested) {
+    setError(error, registryError(kErrorIdentifierMismatch,
+                                  "The install options name no bundle identifier", path));
+    return false;
+  }
+  std::optional<std::string> container = containerDirectoryFor(*requested);
+  if (!container) {
+    setError(error,
+             registryError(kErrorBadPackage, "Invalid bundle identifier " + *requested, path));
+    return false;
+  }
+  const bool hadContainer = directoryExists(*container);
+  const std::string scratch = (fs::path(*container) / kUnpackFolderName).string();
+  removeAll(scratch);  // what an interrupted install left
+  fake_ar::ArchiveLimits limits;
+  {
+    std::lock_guard lock(mutex_);
+    limits = archiveLimits_;
+  }
+  std::string why;
+  std::optional<std::string> bundle = fake_ar::unpackPackageArchive(path, scratch, limits, &why);
+  bool ok = false;
+  if (!bundle) {
+    setError(error, registryError(kErrorBadPackage, "Package archive refused: " + why, path));
+  } else {
+    ok = installBundle(*bundle, path, options, error);
+  }
+  removeAll(scratch);
+  if (!ok && !hadContainer) removeAll(*container);
+  return ok;
+}
+
+bool FakeARWorkspace::installBundle(const std::string& bundle, const std::string& path,
+                                    const plist::Dict& options, ErrorRef* error) {
+  std::string bundlePath = bundle;
   while (bundlePath.size() > 1 && bundlePath.back() == '/') bundlePath.pop_back();
   const std::string bundleName = fs::path(bundlePath).filename().string();
   if (!directoryExists(bundlePath) || bundleName.empty()) {
-    setError(error, registryError(kErrorBadPackage, "Package is not a bundle directory", path));
+    setError(error, registryError(kErrorBadPackage,
+                                  "Package is neither a bundle folder nor a zip archive", path));
     return false;
   }
   std::string why;
@@ -203,6 +249,10 @@ bool FakeARWorkspace::installPackage(const std::string& path, const plist::Dict&
   r.containerDirectory = container;
   r.iconPath = iconIn(installed, *info);
   r.staticDiskUsage = treeSize(installed);
+  // Options without SINF bytes keep what the record had (an update, or the placeholder's).
+  if (const plist::Value* sinf = options.find(ARApplicationSINFKey); sinf && sinf->data()) {
+    r.hasMIDBasedSINF = !sinf->data()->empty();
+  }
   r.lastInstallOptions = options;
   // entry.currentProgress stays null: the install is complete.
 

@@ -164,6 +164,15 @@ std::vector<std::shared_ptr<FakeKCAppInstallCoordinator>> FakeKCInstallCoordinat
   return daemon_->all();
 }
 
+std::optional<FinishedCoordinator> FakeKCInstallCoordination::finishedCoordinator(
+    const std::string& bundleID) const {
+  return daemon_->finished(bundleID);
+}
+
+std::vector<FinishedCoordinator> FakeKCInstallCoordination::finishedCoordinators() const {
+  return daemon_->allFinished();
+}
+
 bool FakeKCInstallCoordination::completeStoreDownload(const std::string& bundleID,
                                                       const std::string& packagePath) {
   std::shared_ptr<FakeKCAppInstallCoordinator> c = daemon_->find(bundleID);

@@ -7,14 +7,17 @@
 //     promise, if any, is complete) gets its placeholder installed: a placeholder record goes
 //     into the registry (name from the placeholder, version from the attributes' bundle version
 //     or else the Info.plist's BNBundleVersion, install type from the placeholder, icon path from
-//     the icon promise). A registry application that is not a placeholder (an update) is left as
-//     it is. coordinatorDidInstallPlaceholder follows.
+//     the icon promise, hasMIDBasedSINF when the placeholder has non-empty SINF bytes). A registry
+//     application that is not a placeholder (an update) is left as it is.
+//     coordinatorDidInstallPlaceholder follows.
 //   - Once the placeholder is installed, the asset promise is complete with a transfer path and
 //     any user-data and SPR promises are complete, the package is installed:
 //     installApplication(path, {"PackageType": "Customer", "BNBundleIdentifier": ID,
-//     "ARInstallType": the install options' type, else the placeholder's}). A "file://" prefix
-//     of the path is dropped. Either way the coordinator finishes, is forgotten by the service,
-//     and coordinatorDidCompleteSuccessfully is delivered. A failed install leaves the
+//     "ARInstallType": the install options' type, else the placeholder's, "CaravelMetadata":
+//     the install options' metadata dictionary, else the placeholder's (left out without
+//     either), "ApplicationSINF": the placeholder's SINF bytes (left out without)}). A
+//     "file://" prefix of the path is dropped. Either way the coordinator finishes, is forgotten by
+//     the service, and coordinatorDidCompleteSuccessfully is delivered. A failed install leaves the
 //     placeholder record in place and sets the coordinator's error (kKCErrorInstallFailed,
 //     underlying the registry's error) before the event, so an observer that checks error()
 //     sees the failure.
@@ -62,6 +65,7 @@
 #include <vector>
 
 #include "platform/fake/fake_kc_errors.h"
+#include "platform/fake/fake_kc_history.h"
 #include "platform/fake/fake_kc_objects.h"
 #include "platform/fake/fake_service.h"
 #include "platform/fake/state_fields.h"
@@ -115,8 +119,9 @@ class FakeKCInstallCoordination final : public KCInstallCoordination, public Fak
   void setCoordinationEnabled(bool enabled);
 
   // Saved state (the simulator's device directory): whether coordination is enabled, every
-  // current coordinator with its promises and placeholder, and the next promise identifier, so
-  // that promises keep their identifiers. Observers and observer registrations are not state.
+  // current coordinator with its promises and placeholder, the next promise identifier, so
+  // that promises keep their identifiers, and the finished coordinators' outcomes. Observers and
+  // observer registrations are not state.
   plist::Dict saveState() const;
   // Replaces the coordinators with saved ones, which a later client finds by bundle identifier
   // and carries on with; each is then re-examined on the event thread, as after any change.
@@ -131,6 +136,13 @@ class FakeKCInstallCoordination final : public KCInstallCoordination, public Fak
   std::shared_ptr<FakeKCAppInstallCoordinator> coordinator(const std::string& bundleID) const;
   // Every current coordinator, by bundle identifier.
   std::vector<std::shared_ptr<FakeKCAppInstallCoordinator>> coordinators() const;
+  // What became of the last coordinator of `bundleID` that completed or was cancelled, recorded
+  // as it finished (before its event). A newer coordinator of the bundle leaves the record in
+  // place until it finishes itself. At most CoordinatorHistory::kCapacity bundles are kept, the
+  // oldest outcome dropped first.
+  std::optional<FinishedCoordinator> finishedCoordinator(const std::string& bundleID) const;
+  // Every kept outcome, the oldest first.
+  std::vector<FinishedCoordinator> finishedCoordinators() const;
 
   // The store daemon delivers the package of a coordinator whose asset is its business
   // (responsible client KCClientBazaar, or a restoring-demoted coordinator): its asset promise

@@ -43,7 +43,7 @@ void FakeKCDaemon::coordinatorChanged(const CoordinatorRef& c) {
 
 void FakeKCDaemon::coordinatorCancelled(const CoordinatorRef& c, const ErrorRef& reason,
                                         std::uint64_t client) {
-  forget(c);
+  retire(c, client);
   post([this, c, reason, client] { reportCancellation(c, reason, client); });
 }
 
@@ -97,6 +97,16 @@ std::vector<FakeKCDaemon::CoordinatorRef> FakeKCDaemon::all() const {
   return out;
 }
 
+std::optional<FinishedCoordinator> FakeKCDaemon::finished(const std::string& bundleID) const {
+  std::lock_guard lock(mutex_);
+  return history_.find(bundleID);
+}
+
+std::vector<FinishedCoordinator> FakeKCDaemon::allFinished() const {
+  std::lock_guard lock(mutex_);
+  return history_.all();
+}
+
 std::uint64_t FakeKCDaemon::nextPromiseIdentifier() {
   std::lock_guard lock(mutex_);
   return nextPromiseIdentifier_++;
@@ -125,9 +135,11 @@ std::uint64_t FakeKCDaemon::upcomingPromiseIdentifier() const {
 }
 
 void FakeKCDaemon::replaceState(std::vector<CoordinatorRef> coordinators,
-                                std::uint64_t nextPromiseIdentifier) {
+                                std::uint64_t nextPromiseIdentifier,
+                                std::vector<FinishedCoordinator> finished) {
   {
     std::lock_guard lock(mutex_);
+    history_.replace(std::move(finished));
     coordinators_.clear();
     std::erase_if(made_, [](const std::weak_ptr<Coordinator>& w) { return w.expired(); });
     for (const CoordinatorRef& c : coordinators) {
@@ -149,10 +161,12 @@ FakeKCDaemon::CoordinatorRef FakeKCDaemon::makeLocked(KCCoordinatorKind kind,
   return c;
 }
 
-void FakeKCDaemon::forget(const CoordinatorRef& c) {
+void FakeKCDaemon::retire(const CoordinatorRef& c, std::optional<std::uint64_t> cancellingClient) {
+  FinishedCoordinator outcome = FinishedCoordinator::of(*c, cancellingClient);
   std::lock_guard lock(mutex_);
   auto it = coordinators_.find(c->bundleID());
   if (it != coordinators_.end() && it->second == c) coordinators_.erase(it);
+  history_.record(std::move(outcome));
 }
 
 // --- The event thread --------------------------------------------------------------------------

@@ -9,6 +9,7 @@
 #include <map>
 #include <memory>
 #include <mutex>
+#include <optional>
 #include <string>
 #include <string_view>
 #include <vector>
@@ -16,6 +17,7 @@
 #include "runtime/error.h"
 #include "runtime/guarded.h"
 #include "platform/fake/callback_thread.h"
+#include "platform/fake/fake_kc_history.h"
 #include "platform/fake/fake_kc_objects.h"
 #include "platform/kc.h"
 
@@ -61,6 +63,10 @@ class FakeKCDaemon final : public FakeKCServiceHooks,
   CoordinatorRef put(KCCoordinatorKind kind, const std::string& bundleID, std::uint64_t creator);
   CoordinatorRef find(const std::string& bundleID) const;
   std::vector<CoordinatorRef> all() const;
+  // The last outcome of a finished coordinator of `bundleID`; see CoordinatorHistory.
+  std::optional<FinishedCoordinator> finished(const std::string& bundleID) const;
+  // Every kept outcome, oldest first.
+  std::vector<FinishedCoordinator> allFinished() const;
   std::uint64_t nextPromiseIdentifier();
   void addRegistration(const FakeKCAppInstallObserver* registration);
   void removeObserverEverywhere(const KCAppInstallObserverDelegate* observer);
@@ -70,7 +76,8 @@ class FakeKCDaemon final : public FakeKCServiceHooks,
   std::uint64_t upcomingPromiseIdentifier() const;
   // Replaces the coordinators and the next promise identifier with loaded ones, then has each
   // re-examined: whatever was still to do when the state was saved gets done.
-  void replaceState(std::vector<CoordinatorRef> coordinators, std::uint64_t nextPromiseIdentifier);
+  void replaceState(std::vector<CoordinatorRef> coordinators, std::uint64_t nextPromiseIdentifier,
+                    std::vector<FinishedCoordinator> finished);
 
   // --- The event thread ---
   void post(std::function<void()> work);
@@ -89,7 +96,9 @@ class FakeKCDaemon final : public FakeKCServiceHooks,
  private:
   CoordinatorRef makeLocked(KCCoordinatorKind kind, const std::string& bundleID,
                             std::uint64_t creator);
-  void forget(const CoordinatorRef& c);
+  // Forgets `c`, which has just completed (no `cancellingClient`) or been cancelled, and
+  // records its outcome.
+  void retire(const CoordinatorRef& c, std::optional<std::uint64_t> cancellingClient);
   bool stopped() const;
   std::shared_ptr<CallbackThread> thread() const;
   // Returns once no delivery that may have read an old observer is running. Inside a delivery
@@ -109,6 +118,7 @@ class FakeKCDaemon final : public FakeKCServiceHooks,
   FakeKCInstallCoordination* owner_;  // null once shut down
   bool stopped_ = false;
   std::map<std::string, CoordinatorRef> coordinators_;
+  CoordinatorHistory history_;
   std::vector<std::weak_ptr<Coordinator>> made_;  // every coordinator still alive
   std::vector<const FakeKCAppInstallObserver*> registrations_;
   std::uint64_t nextPromiseIdentifier_ = 1;

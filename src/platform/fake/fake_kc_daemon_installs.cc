@@ -40,7 +40,7 @@ void FakeKCDaemon::evaluate(const CoordinatorRef& c) {
     if (!placeholder->isReadyToInstall()) return;
     if (ErrorRef failure = scriptedFailure(kInstallPlaceholderOp)) {
       if (c->markCancelled(failure)) {
-        forget(c);
+        retire(c, kServiceClient);
         reportCancellation(c, failure, kServiceClient);
       }
       return;
@@ -64,6 +64,13 @@ void FakeKCDaemon::evaluate(const CoordinatorRef& c) {
   plist::Dict options{{std::string(ARPackageTypeKey), std::string(ARPackageTypeCustomer)},
                       {std::string(kBNBundleIdentifierKey), c->bundleID()},
                       {std::string(ARInstallTypeKey), installType}};
+  std::shared_ptr<const EMStoreMetadata> metadata =
+      s.installOptions && s.installOptions->caravelMetadata() ? s.installOptions->caravelMetadata()
+                                                              : placeholder->metadata();
+  if (metadata) options.set(std::string(ARCaravelMetadataKey), metadata->dictionary());
+  if (std::optional<plist::Bytes> sinf = placeholder->sinfData()) {
+    options.set(std::string(ARApplicationSINFKey), std::move(*sinf));
+  }
   ErrorRef failure = scriptedFailure(kInstallPackageOp);
   if (!failure) {
     ErrorRef registryError;
@@ -76,7 +83,7 @@ void FakeKCDaemon::evaluate(const CoordinatorRef& c) {
     }
   }
   if (!c->finish(failure)) return;
-  forget(c);
+  retire(c, std::nullopt);
   deliver(*c, [&](KCAppInstallObserverDelegate& d) { d.coordinatorDidCompleteSuccessfully(c); });
 }
 
@@ -89,6 +96,8 @@ void FakeKCDaemon::putPlaceholderRecord(Coordinator& c, const FakeKCPlaceholder&
   record.name = placeholder.bundleName();
   record.installType = placeholder.installType();
   record.isPlaceholder = true;
+  std::optional<plist::Bytes> sinf = placeholder.sinfData();
+  record.hasMIDBasedSINF = sinf && !sinf->empty();
   if (std::optional<KCPlaceholderAttributes> attributes = placeholder.attributes()) {
     record.version = attributes->bundleVersion();
     if (!record.version) {

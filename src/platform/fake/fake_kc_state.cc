@@ -127,6 +127,16 @@ plist::Dict coordinatorState(const Coordinator& c) {
   return state;
 }
 
+plist::Dict finishedState(const FinishedCoordinator& f) {
+  plist::Dict state{{"bundleID", f.bundleID},
+                    {"kind", nameOf(kKindNames, f.kind)},
+                    {"state", nameOf(kStateNames, f.state)}};
+  if (f.errorDomain) state.set("errorDomain", *f.errorDomain);
+  if (f.errorCode) state.set("errorCode", *f.errorCode);
+  if (f.cancellingClient) state.set("cancellingClient", *f.cancellingClient);
+  return state;
+}
+
 // --- Loading -----------------------------------------------------------------------------------
 
 // Makes the objects of one saved state. A promise held in several places (its identifier saved
@@ -239,14 +249,33 @@ class Loader {
   std::map<std::uint64_t, std::shared_ptr<KCPromise>> promises_;
 };
 
+FinishedCoordinator finishedFrom(const StateFields& f) {
+  FinishedCoordinator finished{.bundleID = f.string("bundleID"),
+                               .kind = valueOf(kKindNames, f, "kind"),
+                               .state = valueOf(kStateNames, f, "state"),
+                               .errorDomain = f.optionalString("errorDomain"),
+                               .errorCode = f.optionalInteger("errorCode"),
+                               .cancellingClient = f.optionalUnsigned("cancellingClient")};
+  if (finished.state == Coordinator::State::Active)
+    f.fail("state", "expected completed or cancelled");
+  if (finished.errorDomain.has_value() != finished.errorCode.has_value()) {
+    f.fail(finished.errorDomain ? "errorCode" : "errorDomain",
+           "missing (an error has both a domain and a code)");
+  }
+  return finished;
+}
+
 }  // namespace
 
 plist::Dict FakeKCInstallCoordination::saveState() const {
   plist::Dict coordinators;
   for (const auto& c : daemon_->all()) coordinators.set(c->bundleID(), coordinatorState(*c));
+  plist::Array finished;
+  for (const FinishedCoordinator& f : daemon_->allFinished()) finished.push_back(finishedState(f));
   return {{"coordinationEnabled", daemon_->enabled()},
           {"nextPromiseIdentifier", daemon_->upcomingPromiseIdentifier()},
-          {"coordinators", std::move(coordinators)}};
+          {"coordinators", std::move(coordinators)},
+          {"finishedCoordinators", std::move(finished)}};
 }
 
 void FakeKCInstallCoordination::loadState(const StateFields& state) {
@@ -257,8 +286,14 @@ void FakeKCInstallCoordination::loadState(const StateFields& state) {
   for (const auto& [bundleID, value] : saved.dict()) {
     coordinators.push_back(loader.coordinator(bundleID, saved.child(bundleID)));
   }
+  // Missing in a device saved before finished coordinators were kept: none.
+  std::vector<FinishedCoordinator> finished;
+  for (const StateFields& f : state.records("finishedCoordinators")) {
+    finished.push_back(finishedFrom(f));
+  }
   daemon_->setEnabled(enabled);
-  daemon_->replaceState(std::move(coordinators), loader.nextPromiseIdentifier());
+  daemon_->replaceState(std::move(coordinators), loader.nextPromiseIdentifier(),
+                        std::move(finished));
 }
 
 }  // namespace appsync

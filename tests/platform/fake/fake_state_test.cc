@@ -102,6 +102,8 @@ void everyPromiseKind(Process& p, const testing::TempDir& dir) {
   c->setInstallOptions(options, nullptr);
   c->setAppAssetPromiseResponsibleClient(KCClientBazaar, nullptr);
   withPlaceholder(kc, "com.docs");
+  withPlaceholder(kc, "com.dropped")
+      ->cancelForReason(makeError("Test", 7, "dropped"), KCClientBazaar, nullptr);
   kc.putCoordinator(KCCoordinatorKind::RestoringDemoted, "com.other", 9);
   kc.setCoordinationEnabled(false);
 }
@@ -200,8 +202,23 @@ TEST(FakeKCStateTest, ALaterProcessCarriesOnWithALoadedCoordinator) {
             id(first.kc.initPromisedOutOfBandTransfer("next", kSyncClient, 0)));
 }
 
+// A device saved before finished coordinators were kept loads with none.
+TEST(FakeKCStateTest, AnOlderStateHasNoFinishedCoordinators) {
+  testing::TempDir dir;
+  Process first(dir), older(dir);
+  withPlaceholder(first.kc, "com.dropped")->cancelForReason(nullptr, kSyncClient, nullptr);
+  plist::Dict state = first.kc.saveState();
+  ASSERT_EQ(state.find("finishedCoordinators")->array()->size(), 1u);
+  state.erase("finishedCoordinators");
+  older.kc.loadState(StateFields(state));
+  EXPECT_TRUE(older.kc.finishedCoordinators().empty());
+}
+
 plist::Dict& game(plist::Dict& s) {
   return *s.find("coordinators")->dict()->find("com.game")->dict();
+}
+plist::Dict& finished(plist::Dict& s) {
+  return *(*s.find("finishedCoordinators")->array())[0].dict();
 }
 plist::Dict& record(plist::Dict& s, std::size_t i) {
   return *(*s.find("applications")->array())[i].dict();
@@ -228,6 +245,14 @@ TEST(FakeStateTest, ADamagedStateIsRefusedByTheFieldAndChangesNothing) {
       {false, [](plist::Dict& s) { game(s).set("kind", "sideways"); },
        "coordinators.com.game.kind: expected one of any, initiating, updating, restoring, "
        "restoringDemoted"},
+      {false, [](plist::Dict& s) { finished(s).set("state", "active"); },
+       "finishedCoordinators[0].state: expected completed or cancelled"},
+      {false, [](plist::Dict& s) { finished(s).erase("errorCode"); },
+       "finishedCoordinators[0].errorCode: missing (an error has both a domain and a code)"},
+      {false, [](plist::Dict& s) { finished(s).set("cancellingClient", "store"); },
+       "finishedCoordinators[0].cancellingClient: expected an unsigned integer"},
+      {false, [](plist::Dict& s) { s.set("finishedCoordinators", "none"); },
+       "finishedCoordinators: expected an array"},
   };
   testing::TempDir dir;
   Process built(dir), target(dir);

@@ -9,6 +9,7 @@
 
 #include "device_files.h"
 #include "platform/fake/fake_kc_coordinator.h"
+#include "platform/fake/fake_kc_history.h"
 #include "replay/plist_difference.h"
 #include "runtime/fs/files.h"
 #include "runtime/plist/codec.h"
@@ -342,7 +343,7 @@ void checkCoordinator(const YamlField& step) {
   step["app"].string();
   if (auto absent = step.optional("absent")) {
     requireTrue(*absent);
-    for (auto key : {"kind", "state", "placeholderInstalled"}) {
+    for (auto key : {"kind", "state", "placeholderInstalled", "errorDomain", "errorCode"}) {
       if (auto field = step.optional(key)) field->fail("an absent coordinator has no fields");
     }
     return;
@@ -353,6 +354,46 @@ void checkCoordinator(const YamlField& step) {
   if (auto state = step.optional("state"))
     checkChoice(*state, {"Active", "Completed", "Cancelled"});
   if (auto installed = step.optional("placeholderInstalled")) installed->boolean();
+  if (auto domain = step.optional("errorDomain")) domain->string();
+  if (auto code = step.optional("errorCode")) code->integer();
+}
+
+// The first field of `step` whose expected text differs from what was `found`.
+std::optional<std::string> firstDifference(
+    const std::string& app, const YamlField& step,
+    std::initializer_list<std::pair<std::string_view, std::string>> found) {
+  for (const auto& [key, value] : found) {
+    auto expected = step.optional(key);
+    if (!expected) continue;
+    const std::string wanted =
+        key == "errorCode" ? std::to_string(expected->integer()) : expected->node().Scalar();
+    if (wanted != value) {
+      return app + ": " + std::string(key) + ": expected " + wanted + ", found " + value;
+    }
+  }
+  return std::nullopt;
+}
+
+// A finished coordinator (no current one), for a script that asks for Completed or Cancelled.
+std::optional<std::string> evaluateFinishedCoordinator(DeviceSession& session,
+                                                       const YamlField& step,
+                                                       const std::string& app) {
+  const std::string state = step["state"].string();
+  std::optional<FinishedCoordinator> finished = session.device().kc().finishedCoordinator(app);
+  if (!finished) {
+    return "expected a coordinator for " + app + " (" + state +
+           "), found none, current or finished";
+  }
+  if (step.has("placeholderInstalled")) {
+    return "expected a current coordinator for " + app + ", found only a finished one (" +
+           nameOf(kStates, finished->state) + ")";
+  }
+  return firstDifference(
+      app, step,
+      {{"kind", nameOf(kKinds, finished->kind)},
+       {"state", nameOf(kStates, finished->state)},
+       {"errorDomain", finished->errorDomain.value_or("none")},
+       {"errorCode", finished->errorCode ? std::to_string(*finished->errorCode) : "none"}});
 }
 
 std::optional<std::string> evaluateCoordinator(DeviceSession& session, const YamlField& step,
@@ -364,20 +405,20 @@ std::optional<std::string> evaluateCoordinator(DeviceSession& session, const Yam
     return "expected no coordinator for " + app + ", found one (" +
            nameOf(kKinds, coordinator->kind()) + ")";
   }
-  if (!coordinator) return "expected a coordinator for " + app + ", found none";
-  const auto snapshot = coordinator->snapshot();
-  const std::pair<std::string_view, std::string> found[] = {
-      {"kind", nameOf(kKinds, coordinator->kind())},
-      {"state", nameOf(kStates, snapshot.state)},
-      {"placeholderInstalled", snapshot.placeholderInstalled ? "true" : "false"}};
-  for (const auto& [key, value] : found) {
-    auto expected = step.optional(key);
-    if (expected && expected->node().Scalar() != value) {
-      return app + ": " + std::string(key) + ": expected " + expected->node().Scalar() +
-             ", found " + value;
-    }
+  if (!coordinator) {
+    auto state = step.optional("state");
+    if (state && state->string() != "Active")
+      return evaluateFinishedCoordinator(session, step, app);
+    return "expected a coordinator for " + app + ", found none";
   }
-  return std::nullopt;
+  const auto snapshot = coordinator->snapshot();
+  return firstDifference(
+      app, step,
+      {{"kind", nameOf(kKinds, coordinator->kind())},
+       {"state", nameOf(kStates, snapshot.state)},
+       {"placeholderInstalled", snapshot.placeholderInstalled ? "true" : "false"},
+       {"errorDomain", snapshot.error ? snapshot.error->domain : "none"},
+       {"errorCode", snapshot.error ? std::to_string(snapshot.error->code) : "none"}});
 }
 
 // --- the table ---
@@ -403,7 +444,7 @@ const std::vector<Kind>& kinds() {
       {"homescreen", {"syncState", "iconLayout"}, checkHomescreen, evaluateHomescreen},
       {"transactions", {"entries", "since"}, checkTransactions, evaluateTransactions},
       {"coordinator",
-       {"app", "absent", "kind", "state", "placeholderInstalled"},
+       {"app", "absent", "kind", "state", "placeholderInstalled", "errorDomain", "errorCode"},
        checkCoordinator,
        evaluateCoordinator},
   };

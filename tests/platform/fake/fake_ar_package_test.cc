@@ -1,0 +1,208 @@
+// Package installs into the fake registry: a zip archive installs like its bundle folder, a
+// hostile or broken archive is refused as a bad package with nothing written, and the SINF
+// bytes of the options decide the record's hasMIDBasedSINF.
+#include <gtest/gtest.h>
+
+#include <filesystem>
+#include <fstream>
+#include <map>
+#include <string>
+#include <vector>
+
+#include "platform/bundle_keys.h"
+#include "platform/fake/fake_ar.h"
+#include "runtime/fs/files.h"
+#include "runtime/plist/codec.h"
+#include "support/temp_dir.h"
+#include "support/zip_archive.h"
+
+namespace appsync {
+namespace {
+
+namespace fs = std::filesystem;
+using testing::ZipEntry;
+using Kind = ZipEntry::Kind;
+
+constexpr std::int64_t kBadPackage = 2;
+
+std::string infoPlist(const std::string& id, const std::string& version) {
+  return *plist::writeXml(plist::Dict{{std::string(kBNBundleIdentifierKey), id},
+                                      {std::string(kBNBundleVersionKey), version}});
+}
+
+plist::Dict packageOptions(const std::string& id) {
+  return {{std::string(ARPackageTypeKey), std::string(ARPackageTypeCustomer)},
+          {std::string(kBNBundleIdentifierKey), id}};
+}
+
+// Every file and folder below `dir`, relative to it, with a file's bytes ("" for a folder).
+std::map<std::string, std::string> tree(const fs::path& dir) {
+  std::map<std::string, std::string> out;
+  std::error_code ec;
+  for (fs::recursive_directory_iterator it(dir, ec), end; !ec && it != end; it.increment(ec)) {
+    std::string bytes;
+    if (it->is_regular_file()) {
+      std::ifstream in(it->path(), std::ios::binary);
+      bytes.assign(std::istreambuf_iterator<char>(in), {});
+    }
+    out[fs::relative(it->path(), dir).string()] = bytes;
+  }
+  return out;
+}
+
+class FakeARPackageTest : public ::testing::Test {
+ protected:
+  testing::TempDir root;      // the device
+  testing::TempDir packages;  // where packages are delivered from
+  FakeARWorkspace registry{root.path()};
+};
+
+TEST_F(FakeARPackageTest, AZipInstallsTheBundleFolderItHolds) {
+  const std::string info = infoPlist("com.game", "3.1");
+  const std::string level(5000, 'x');
+  struct Case {
+    const char* name;
+    std::string archive;
+    std::vector<ZipEntry> entries;
+    std::string bundle;
+  };
+  const Case cases[] = {
+      {"with folder entries",
+       "Game.zip",
+       {{"Game.app/", "", Kind::Folder},
+        {"Game.app/Info.plist", info},
+        {"Game.app/Data/", "", Kind::Folder},
+        {"Game.app/Data/level", level}},
+       "Game.app"},
+      {"folders implied by the files",
+       "Game.zip",
+       {{"Game.app/Info.plist", info}, {"Game.app/Data/level", level}},
+       "Game.app"},
+      {"the archive named apart from its bundle",
+       "Download.zip",
+       {{"Arcade.app/Info.plist", info}, {"Arcade.app/Data/level", level}},
+       "Arcade.app"},
+  };
+  for (const Case& c : cases) {
+    SCOPED_TRACE(c.name);
+    const std::string archive = packages / c.archive;
+    testing::writeZip(archive, c.entries);
+    ErrorRef error;
+    ASSERT_TRUE(registry.installApplication(archive, packageOptions("com.game"), &error))
+        << (error ? error->describe() : "");
+
+    const std::string container = *registry.containerDirectoryFor("com.game");
+    auto record = registry.application("com.game");
+    ASSERT_TRUE(record);
+    EXPECT_EQ(record->bundleDirectory, container + "/" + c.bundle);
+    EXPECT_EQ(record->version, "3.1");
+    EXPECT_EQ(record->staticDiskUsage, info.size() + level.size());
+    EXPECT_FALSE(record->isPlaceholder);
+    // The container holds the bundle only: no scratch folder is left.
+    const std::map<std::string, std::string> expected = {{c.bundle, ""},
+                                                         {c.bundle + "/Info.plist", info},
+                                                         {c.bundle + "/Data", ""},
+                                                         {c.bundle + "/Data/level", level}};
+    EXPECT_EQ(tree(container), expected);
+    EXPECT_TRUE(fileExists(archive)) << "the delivered package is the caller's";
+  }
+}
+
+TEST_F(FakeARPackageTest, ABadPackageIsRefusedAndWritesNothing) {
+  const std::string info = infoPlist("com.game", "2.0");
+  const ZipEntry plistEntry{"Game.app/Info.plist", info};
+  struct Case {
+    const char* name;
+    std::vector<ZipEntry> entries;  // written as an archive unless `raw` is set
+    std::string raw{};
+    fake_ar::ArchiveLimits limits{};
+  };
+  const Case cases[] = {
+      {"a name leading up", {plistEntry, {"../../../../escaped", "x"}}},
+      {"a name leading up from inside the bundle", {plistEntry, {"Game.app/../../escaped", "x"}}},
+      {"an absolute name", {plistEntry, {"/escaped", "x"}}},
+      {"a symbolic link", {plistEntry, {"Game.app/link", "/etc", Kind::Link}}},
+      {"two bundles", {plistEntry, {"Other.app/Info.plist", info}}},
+      {"a file beside the bundle", {plistEntry, {"stray", "x"}}},
+      {"no bundle folder", {{"Game/Info.plist", info}}},
+      {"an empty archive", {}, std::string("PK\x05\x06", 4) + std::string(18, '\0')},
+      {"not an archive", {}, "PK\x03\x04 these bytes are no archive"},
+      {"more bytes than allowed",
+       {plistEntry, {"Game.app/big", std::string(4000, '\0')}},
+       "",
+       {.maxTotalBytes = 3000, .maxEntries = 100}},
+      {"more entries than allowed",
+       {plistEntry, {"Game.app/a", "1"}, {"Game.app/b", "2"}, {"Game.app/c", "3"}},
+       "",
+       {.maxTotalBytes = 1 << 20, .maxEntries = 3}},
+  };
+  // Each case on a device without the application, then on one where it is installed.
+  for (bool installedBefore : {false, true}) {
+    testing::TempDir device;
+    FakeARWorkspace ar(device.path());
+    if (installedBefore) {
+      testing::writeZip(packages / "Good.zip", {plistEntry});
+      ASSERT_TRUE(
+          ar.installApplication(packages / "Good.zip", packageOptions("com.game"), nullptr));
+    }
+    const auto deviceBefore = tree(device.path());
+    const auto recordBefore = ar.application("com.game");
+    for (const Case& c : cases) {
+      SCOPED_TRACE(std::string(c.name) + (installedBefore ? ", installed before" : ""));
+      const std::string archive = packages / "Game.zip";
+      if (c.raw.empty()) {
+        testing::writeZip(archive, c.entries);
+      } else {
+        writeFileAtomically(archive, plist::Bytes(c.raw.begin(), c.raw.end()));
+      }
+      ar.setArchiveLimits(c.limits);
+      ErrorRef error;
+      EXPECT_FALSE(ar.installApplication(archive, packageOptions("com.game"), &error));
+      ASSERT_TRUE(error);
+      EXPECT_EQ(error->domain, kAppRegistryErrorDomain);
+      EXPECT_EQ(error->code, kBadPackage) << error->describe();
+      EXPECT_EQ(tree(device.path()), deviceBefore);
+      EXPECT_EQ(ar.application("com.game"), recordBefore);
+      EXPECT_FALSE(fileExists(packages / "escaped"));
+    }
+  }
+  // Neither a bundle folder nor an archive.
+  writeFileAtomically(packages / "stray-file", plist::Bytes{1, 2, 3});
+  for (const std::string& path : {packages / "Missing.zip", packages / "stray-file"}) {
+    ErrorRef error;
+    EXPECT_FALSE(registry.installApplication(path, packageOptions("com.game"), &error));
+    ASSERT_TRUE(error);
+    EXPECT_EQ(error->code, kBadPackage) << path;
+  }
+}
+
+TEST_F(FakeARPackageTest, TheOptionsSINFBytesMarkTheRecord) {
+  struct Case {
+    const char* name;
+    std::optional<bool> before;        // the record's mark before the install; none: new
+    std::optional<plist::Bytes> sinf;  // ApplicationSINF in the options
+    bool expected;
+  };
+  const Case cases[] = {
+      {"a new application without SINF", std::nullopt, std::nullopt, false},
+      {"a new application with SINF", std::nullopt, plist::Bytes{7, 7}, true},
+      {"an update without SINF keeps the mark", true, std::nullopt, true},
+      {"an update with empty SINF clears it", true, plist::Bytes{}, false},
+      {"an update with SINF sets it", false, plist::Bytes{1}, true},
+  };
+  testing::writeZip(packages / "Game.zip", {{"Game.app/Info.plist", infoPlist("com.game", "1")}});
+  for (const Case& c : cases) {
+    SCOPED_TRACE(c.name);
+    registry.removeApplication("com.game");
+    if (c.before) registry.putApplication({.identifier = "com.game", .hasMIDBasedSINF = *c.before});
+    plist::Dict options = packageOptions("com.game");
+    if (c.sinf) options.set(std::string(ARApplicationSINFKey), *c.sinf);
+    ASSERT_TRUE(registry.installApplication(packages / "Game.zip", options, nullptr));
+    EXPECT_EQ(registry.application("com.game")->hasMIDBasedSINF, c.expected);
+    EXPECT_EQ(registry.applicationProxyForIdentifier("com.game", false)->hasMIDBasedSINF,
+              c.expected);
+  }
+}
+
+}  // namespace
+}  // namespace appsync
