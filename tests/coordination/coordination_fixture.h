@@ -1,0 +1,188 @@
+// A device on the coordinated road whose install-coordination service records what the client
+// asks of it, and the readers the coordination tests share.
+#pragma once
+
+#include <gtest/gtest.h>
+
+#include <memory>
+#include <mutex>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "client/apps_client.h"
+#include "platform/fake/fake_platform.h"
+#include "platform/kc_wrapper.h"
+#include "restore/placeholder_fixture.h"
+#include "runtime/fs/files.h"
+#include "runtime/plist/codec.h"
+#include "support/temp_dir.h"
+
+namespace appsync::testing {
+
+// Keeps every coordinator lookup, placeholder and promise the client obtains, so that a test
+// still sees them after the service has let them go (a cancelled coordinator is forgotten).
+// Called on the test's thread only.
+class RecordingCoordination : public KCInstallCoordinationWrapper {
+ public:
+  struct Lookup {
+    KCCoordinatorKind kind;
+    std::uint64_t client;
+    bool create;
+  };
+  struct Made {
+    std::string name;
+    std::uint64_t client;
+    std::optional<std::string> transferPath;
+    std::uint64_t diskSpaceNeeded;
+    std::shared_ptr<KCPromise> promise;  // null when the service refused
+  };
+  struct PresentableError {
+    std::int64_t code, detail;
+    ErrorRef underlying;
+  };
+
+  using KCInstallCoordinationWrapper::KCInstallCoordinationWrapper;
+
+  std::shared_ptr<KCAppInstallCoordinator> coordinatorForAppWithBundleID(
+      KCCoordinatorKind kind, const std::string& bundleID, std::uint64_t clientID,
+      bool createIfNotExisting, bool* created, ErrorRef* error) override {
+    lookups.push_back({kind, clientID, createIfNotExisting});
+    auto c = staleAnswer ? staleAnswer
+                         : KCInstallCoordinationWrapper::coordinatorForAppWithBundleID(
+                               kind, bundleID, clientID, createIfNotExisting, created, error);
+    if (c) obtained.push_back(std::dynamic_pointer_cast<FakeKCAppInstallCoordinator>(c));
+    return c;
+  }
+  std::shared_ptr<KCPlaceholder> initAppPlaceholder(const std::string& bundleName,
+                                                    const std::string& bundleID,
+                                                    std::uint64_t installType,
+                                                    std::uint64_t client) override {
+    auto p =
+        KCInstallCoordinationWrapper::initAppPlaceholder(bundleName, bundleID, installType, client);
+    if (p) placeholders.push_back(std::dynamic_pointer_cast<FakeKCPlaceholder>(p));
+    return p;
+  }
+  std::shared_ptr<KCPromisedTransferToPath> initPromisedTransferToPath(
+      const std::string& name, std::uint64_t client, const std::optional<std::string>& transferPath,
+      std::uint64_t diskSpaceNeeded) override {
+    auto p = KCInstallCoordinationWrapper::initPromisedTransferToPath(name, client, transferPath,
+                                                                      diskSpaceNeeded);
+    made.push_back({name, client, transferPath, diskSpaceNeeded, p});
+    return p;
+  }
+  std::shared_ptr<KCPromisedOutOfBandTransfer> initPromisedOutOfBandTransfer(
+      const std::string& name, std::uint64_t client, std::uint64_t diskSpaceNeeded) override {
+    auto p =
+        KCInstallCoordinationWrapper::initPromisedOutOfBandTransfer(name, client, diskSpaceNeeded);
+    made.push_back({name, client, std::nullopt, diskSpaceNeeded, p});
+    return p;
+  }
+  ErrorRef KCCreateUserPresentableError(std::int64_t code, std::int64_t detail,
+                                        const ErrorRef& underlying) override {
+    presentableErrors.push_back({code, detail, underlying});
+    return KCInstallCoordinationWrapper::KCCreateUserPresentableError(code, detail, underlying);
+  }
+  void uninstallAppWithBundleID(const std::string& bundleID, bool requestUserConfirmation,
+                                std::function<void(ErrorRef)> completion) override {
+    uninstallConfirmations.push_back(requestUserConfirmation);
+    KCInstallCoordinationWrapper::uninstallAppWithBundleID(bundleID, requestUserConfirmation,
+                                                           std::move(completion));
+  }
+
+  // When set, every lookup answers this coordinator (one the service has already let go of).
+  std::shared_ptr<KCAppInstallCoordinator> staleAnswer;
+  std::vector<Lookup> lookups;
+  std::vector<std::shared_ptr<FakeKCAppInstallCoordinator>> obtained;
+  std::vector<std::shared_ptr<FakeKCPlaceholder>> placeholders;
+  std::vector<Made> made;
+  std::vector<PresentableError> presentableErrors;
+  std::vector<bool> uninstallConfirmations;
+};
+
+inline FakePlatform::Options coordinatedRoad() {
+  FakePlatform::Options options;
+  options.coordination = true;
+  return options;
+}
+
+// An error a scripted service call reports.
+inline ErrorRef serviceError() { return makeKCError(77, "scripted"); }
+inline std::string serviceErrorText() { return serviceError()->describe(); }
+
+// "Error Domain=TRError Code=N" for a cancellation reason; "(not cancelled)" for none.
+inline std::string reasonText(const ErrorRef& reason) {
+  return reason ? reason->describe() : "(not cancelled)";
+}
+
+// Hears every cancellation of a coordinator made under client 3 or 7, as
+// "ID REASON by client N". Safe from the service's thread.
+class CancellationWatcher : public KCAppInstallObserverDelegate {
+ public:
+  void coordinator(const std::shared_ptr<KCAppInstallCoordinator>& c, const ErrorRef& reason,
+                   std::uint64_t client) override {
+    std::lock_guard lock(mutex_);
+    seen_.push_back(c->bundleID() + " " + reasonText(reason) + " by client " +
+                    std::to_string(client));
+  }
+  std::vector<std::string> seen() const {
+    std::lock_guard lock(mutex_);
+    return seen_;
+  }
+
+ private:
+  mutable std::mutex mutex_;
+  std::vector<std::string> seen_;
+};
+
+struct CoordinationDevice {
+  TempDir root;
+  FakePlatform device{root.path(), coordinatedRoad()};
+  RecordingCoordination kc{device.kc()};
+  AppsClient client{device.platform().with(kc)};
+  CancellationWatcher cancellations;
+  std::shared_ptr<KCAppInstallObserver> watching =
+      device.kc().initAppInstallObserver("test.cancellations", {3, 7}, &cancellations);
+
+  CoordinationDevice() {
+    device.log().clear();
+    device.transactionLog().clear();
+  }
+  // Background work of the service may reach the client: it ends before the client does.
+  ~CoordinationDevice() { device.kc().drain(); }
+
+  // The messages of one category without their "%s|" prefix; error-level ones marked.
+  std::vector<std::string> logged(int category = 8) const {
+    const std::string prefix = pluginLine("");
+    std::vector<std::string> out;
+    for (const auto& line : device.log().lines()) {
+      if (line.category != category) continue;
+      std::string text = line.message.starts_with(prefix) ? line.message.substr(prefix.size())
+                                                          : "(no prefix) " + line.message;
+      out.push_back((line.level == LogLevel::Error ? "[error] " : "") + text);
+    }
+    return out;
+  }
+  std::vector<std::string> steps() const {
+    std::vector<std::string> out;
+    for (const auto& e : device.transactionLog().steps()) out.push_back(e.describe());
+    return out;
+  }
+  std::string placeholderDir(const std::string& id) {
+    return client.placeholderAppPathForBundleIdentifier(id).value_or("(none)");
+  }
+  std::string appsDir() const { return root / "tmp/com.vantor.trc.Apps"; }
+  std::shared_ptr<FakeKCAppInstallCoordinator> put(KCCoordinatorKind kind, const std::string& id,
+                                                   std::uint64_t creator = 3) {
+    return device.kc().putCoordinator(kind, id, creator);
+  }
+};
+
+// "step N party 1 phase P success S ID: TEXT", as the fake transaction log describes a step.
+inline std::string step(int n, int phase, bool success, const std::string& id,
+                        const std::string& text) {
+  return "step " + std::to_string(n) + " party 1 phase " + std::to_string(phase) + " success " +
+         (success ? "1 " : "0 ") + id + ": " + text;
+}
+
+}  // namespace appsync::testing
