@@ -115,6 +115,31 @@ inline std::string reasonText(const ErrorRef& reason) {
   return reason ? reason->describe() : "(not cancelled)";
 }
 
+// A promise as the fake describes it (name, client, size, progress, path), and why it was
+// cancelled; "(none)" for no promise.
+inline std::string promiseState(const std::shared_ptr<KCPromise>& promise) {
+  if (!promise) return "(none)";
+  return promise->describe() + " " +
+         reasonText(dynamic_cast<FakeKCPromiseBase&>(*promise).cancelReason());
+}
+// What promiseState gives for a file promise "com.example.app-SUFFIX" of client 3.
+inline std::string filePromise(const std::string& suffix, std::uint64_t diskSpace,
+                               const std::string& percent, bool complete, const std::string& path,
+                               const std::string& reason = "(not cancelled)") {
+  return "<KCPromisedTransferToPath name=com.example.app-" + suffix +
+         " client=3 diskSpaceNeeded=" + std::to_string(diskSpace) + " percentComplete=" + percent +
+         " complete=" + (complete ? "YES" : "NO") +
+         " cancelled=" + (reason == "(not cancelled)" ? "NO" : "YES") + " transferPath=" + path +
+         "> " + reason;
+}
+// A placeholder as the fake describes it, whether it is configured, and why it was cancelled.
+inline std::string placeholderState(const std::shared_ptr<FakeKCPlaceholder>& placeholder) {
+  if (!placeholder) return "(none)";
+  return placeholder->describe() +
+         (placeholder->isConfigurationComplete() ? " configured " : " unconfigured ") +
+         reasonText(placeholder->cancelReason());
+}
+
 // Hears every cancellation of a coordinator made under client 3 or 7, as
 // "ID REASON by client N". Safe from the service's thread.
 class CancellationWatcher : public KCAppInstallObserverDelegate {
@@ -152,7 +177,7 @@ struct CoordinationDevice {
   ~CoordinationDevice() { device.kc().drain(); }
 
   // The messages of one category without their "%s|" prefix; error-level ones marked.
-  std::vector<std::string> logged(int category = 8) const {
+  std::vector<std::string> logged(int category = 8) {
     const std::string prefix = pluginLine("");
     std::vector<std::string> out;
     for (const auto& line : device.log().lines()) {
@@ -163,7 +188,7 @@ struct CoordinationDevice {
     }
     return out;
   }
-  std::vector<std::string> steps() const {
+  std::vector<std::string> steps() {
     std::vector<std::string> out;
     for (const auto& e : device.transactionLog().steps()) out.push_back(e.describe());
     return out;
@@ -183,6 +208,25 @@ inline std::string step(int n, int phase, bool success, const std::string& id,
                         const std::string& text) {
   return "step " + std::to_string(n) + " party 1 phase " + std::to_string(phase) + " success " +
          (success ? "1 " : "0 ") + id + ": " + text;
+}
+
+// The message of a coordinator lookup for "com.example.app" that came back with the initiating
+// (or, for an existing app, updating) coordinator of `creator`, with no error.
+inline std::string coordinatorLine(bool existingApp, bool create, std::uint64_t creator = 3) {
+  const std::string kind = existingApp ? "updating" : "initiating";
+  const std::string flags = "createIfNotExisting:" + std::to_string(create) +
+                            ", existingApp:" + std::to_string(existingApp);
+  const std::string object =
+      std::string("<") + (existingApp ? "KCUpdating" : "KCInitiating") +
+      "AppInstallCoordinator bundleID=com.example.app creator=" + std::to_string(creator) + ">";
+  if (creator == kAppSyncCoordinationClient) {
+    return "Created " + kind + " coordinator " + object + " (" + flags +
+           ") for com.example.app with error (null)";
+  }
+  return "IC returned " + kind + " coordinator " + object + " (" + flags +
+         ", creatorIdentifier=" + std::to_string(creator) +
+         ") for com.example.app with error (null) - Will not perform install/update for this "
+         "bundle";
 }
 
 }  // namespace appsync::testing
