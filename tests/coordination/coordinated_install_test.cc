@@ -3,9 +3,6 @@
 // uninstall through the service.
 #include <gtest/gtest.h>
 
-#include <algorithm>
-#include <filesystem>
-
 #include "coordination/coordination_fixture.h"
 
 namespace appsync::coordinated_install_tests {
@@ -150,89 +147,32 @@ TEST(CoordinatedInstallTest, PreparationReadiesCoordinatorPromisesAndPlaceholder
   }
 }
 
-TEST(CoordinatedInstallTest, PreparationAddsOnlyWhatTheCoordinatorLacks) {
-  for (bool hasEverything : {true, false}) {
-    SCOPED_TRACE(hasEverything);
-    InstallDevice d;
-    FakeKCInstallCoordination& kc = d.device.kc();
-    auto coordinator = d.put(Kind::Initiating, kID);
-    auto options = std::make_shared<EMInstallOptions>();
-    ASSERT_TRUE(coordinator->setInstallOptions(options, nullptr));
-    if (hasEverything) {
-      ASSERT_TRUE(coordinator->setInitialSPRAssetPromises({}, nullptr));
-      ASSERT_TRUE(coordinator->setAppAssetPromise(
-          kc.initPromisedTransferToPath(kID + "-Asset", 3, std::nullopt, 0), nullptr));
-      auto placeholder = kc.initAppPlaceholder("Old", kID, 4, 3);
-      ASSERT_TRUE(placeholder->setConfigurationCompleteWithError(nullptr));
-      ASSERT_TRUE(coordinator->setPlaceholderPromise(placeholder, nullptr));
-    }
+TEST(CoordinatedInstallTest, PreparationOfACoordinatorThatHasEverythingSetsNothing) {
+  InstallDevice d;
+  FakeKCInstallCoordination& kc = d.device.kc();
+  auto coordinator = d.put(Kind::Initiating, kID);
+  ASSERT_TRUE(coordinator->setInstallOptions(std::make_shared<EMInstallOptions>(), nullptr));
+  ASSERT_TRUE(coordinator->setInitialSPRAssetPromises({}, nullptr));
+  ASSERT_TRUE(coordinator->setAppAssetPromise(
+      kc.initPromisedTransferToPath(kID + "-Asset", 3, std::nullopt, 0), nullptr));
+  auto placeholder = kc.initAppPlaceholder("Old", kID, 4, 3);
+  ASSERT_TRUE(placeholder->setConfigurationCompleteWithError(nullptr));
+  ASSERT_TRUE(coordinator->setPlaceholderPromise(placeholder, nullptr));
 
-    EXPECT_TRUE(d.client.prepareAppForInstallUsingCoordination(d.asset(kID), false));
+  EXPECT_TRUE(d.client.prepareAppForInstallUsingCoordination(d.asset(kID), false));
 
-    EXPECT_EQ(coordinator->snapshot().installOptions, options);
-    EXPECT_EQ(kc.callCount("setInstallOptions:error:"), 1u);
-    const Messages logged = d.logged();
-    if (hasEverything) {
-      const std::string has = "coordinator for com.example.app has ";
-      EXPECT_EQ(logged, (Messages{coordinatorLine(false, true), has + "install options",
+  const std::string has = "coordinator for com.example.app has ";
+  EXPECT_EQ(d.logged(), (Messages{coordinatorLine(false, true), has + "install options",
                                   has + "an SPR app asset promise", has + "an app asset promise",
                                   has + "a placeholder promise", finishedLine(true, "(null)")}));
-      EXPECT_TRUE(d.kc.made.empty());
-      EXPECT_TRUE(d.kc.placeholders.empty());
-      EXPECT_EQ(d.steps(), (Messages{step(1, 1, true, kID, "Install App"),
-                                     step(3, 1, true, kID, "Create coordinator"),
-                                     step(3, 2, true, kID, "Finished creating coordinator"),
-                                     step(1, 2, true, kID, "Install app")}));
-    } else {
-      // No store-metadata object is built then, so the placeholder gets none.
-      ASSERT_GE(logged.size(), 2u);
-      EXPECT_EQ(logged[1], "coordinator for com.example.app has install options");
-      EXPECT_EQ(logged.back(), finishedLine(true, "(null)"));
-      ASSERT_EQ(d.kc.placeholders.size(), 1u);
-      EXPECT_EQ(coordinator->snapshot().placeholder, d.kc.placeholders[0]);
-      EXPECT_EQ(d.kc.placeholders[0]->metadata(), nullptr);
-      EXPECT_EQ(kc.callCount("setMetadata:error:"), 1u);
-    }
-  }
-}
-
-TEST(CoordinatedInstallTest, PlaceholderIsMadeWhateverBecomesOfTheIcon) {
-  enum Icon { kNoIconPath, kCopyFails, kNoDirectory };
-  for (Icon icon : {kNoIconPath, kCopyFails, kNoDirectory}) {
-    SCOPED_TRACE(icon);
-    InstallDevice d;
-    auto asset = d.asset(kID, "Pretty", icon != kNoIconPath);
-    if (icon == kCopyFails) std::filesystem::remove(*asset->icon());
-    if (icon == kNoDirectory) {
-      ASSERT_TRUE(writeFileAtomically(d.appsDir(), plist::Bytes{'x'}));
-    }
-
-    EXPECT_TRUE(d.client.prepareAppForInstallUsingCoordination(asset, false));
-
-    ASSERT_EQ(d.kc.placeholders.size(), 1u);
-    EXPECT_EQ(d.kc.placeholders[0]->iconPromise(), nullptr);
-    EXPECT_EQ(d.kc.obtained[0]->snapshot().placeholder, d.kc.placeholders[0]);
-    EXPECT_EQ(d.kc.made.size(), 1u);  // the asset promise only
-    Messages copies, iconSteps;
-    for (const auto& line : d.logged()) {
-      if (line.starts_with("Copied icon") || line.starts_with("icon for")) copies.push_back(line);
-    }
-    for (const auto& line : d.steps()) {
-      if (line.starts_with("step 5 ")) iconSteps.push_back(line);
-    }
-    if (icon != kCopyFails) {
-      EXPECT_TRUE(copies.empty());
-      EXPECT_TRUE(iconSteps.empty());
-      continue;
-    }
-    EXPECT_EQ(iconSteps, (Messages{step(5, 1, true, kID, "Copying icon"),
-                                   step(5, 2, true, kID, "Copying icon")}));
-    ASSERT_EQ(copies.size(), 1u);
-    EXPECT_TRUE(copies[0].starts_with("Copied icon from " + *asset->icon() + " to " +
-                                      d.placeholderDir(kID) + "/Icon.png with error Error Domain="))
-        << copies[0];
-    EXPECT_TRUE(copies[0].ends_with(" for 'com.example.app', sizeOnDisk:0")) << copies[0];
-  }
+  EXPECT_TRUE(d.kc.made.empty());
+  EXPECT_TRUE(d.kc.placeholders.empty());
+  EXPECT_EQ(kc.callCount("setInstallOptions:error:"), 1u);
+  EXPECT_EQ(kc.callCount("setInitialSPRAssetPromises:error:"), 1u);
+  EXPECT_EQ(d.steps(), (Messages{step(1, 1, true, kID, "Install App"),
+                                 step(3, 1, true, kID, "Create coordinator"),
+                                 step(3, 2, true, kID, "Finished creating coordinator"),
+                                 step(1, 2, true, kID, "Install app")}));
 }
 
 TEST(CoordinatedInstallTest, AFailedPreparationCancelsWhatItObtained) {
@@ -254,58 +194,32 @@ TEST(CoordinatedInstallTest, AFailedPreparationCancelsWhatItObtained) {
     std::string finalError;
     bool coordinatorCancelled = true, placeholderCancelled = true;
   };
+  const std::string scripted = serviceErrorText();
+  // clang-format off
   const Case cases[] = {
-      {"setInstallOptions:error:",
-       {e + " setting install options on coordinator for 'com.example.app'"},
-       serviceErrorText(),
-       true,
-       false},
-      {"setInitialSPRAssetPromises:error:",
-       {e + " setting SPR asset promise for 'com.example.app'"},
-       serviceErrorText(),
-       true,
-       false},
-      {"setAppAssetPromise:error:",
-       {e + " adding app asset promise at (null) to 'com.example.app'",
-        "[error] Cancelling asset promise for 'com.example.app'"},
-       serviceErrorText(),
-       true,
-       false},
+      {"setInstallOptions:error:", {e + " setting install options on coordinator for '" + kID + "'"}, scripted, true, false},
+      {"setInitialSPRAssetPromises:error:", {e + " setting SPR asset promise for '" + kID + "'"}, scripted, true, false},
+      {"setAppAssetPromise:error:", {e + " adding app asset promise at (null) to '" + kID + "'",
+                                     "[error] Cancelling asset promise for '" + kID + "'"}, scripted, true, false},
       {"KCPromisedTransferToPath initWithName:client:diskSpaceNeeded:",
-       {"[error] Error creating asset promise for 'com.example.app'"},
-       "(null)",
-       true,
-       false},
+       {"[error] Error creating asset promise for '" + kID + "'"}, "(null)", true, false},
       // A placeholder whose configuration broke off is still offered; this service refuses it.
-      {"setIconPromise:error:",
-       {e + " adding icon promise to placeholder for 'com.example.app'",
-        handOverRefused(notConfigured)},
-       notConfigured},
-      {"setPlaceholderAttributes:error:",
-       {e + " setting attributes on placeholder for 'com.example.app'",
-        handOverRefused(notConfigured)},
-       notConfigured},
-      {"setMetadata:error:",
-       {e + " setting store metadata on placeholder for 'com.example.app'",
-        handOverRefused(notConfigured)},
-       notConfigured},
+      {"setIconPromise:error:", {e + " adding icon promise to placeholder for '" + kID + "'",
+                                 handOverRefused(notConfigured)}, notConfigured},
+      {"setPlaceholderAttributes:error:", {e + " setting attributes on placeholder for '" + kID + "'",
+                                           handOverRefused(notConfigured)}, notConfigured},
+      {"setMetadata:error:", {e + " setting store metadata on placeholder for '" + kID + "'",
+                              handOverRefused(notConfigured)}, notConfigured},
       {"setConfigurationCompleteWithError:",
-       {e + " setting placeholder configuration as complete for 'com.example.app'",
-        handOverRefused(notConfigured)},
-       notConfigured},
-      {"setPlaceholderPromise:error:", {handOverRefused(serviceErrorText())}, serviceErrorText()},
+       {e + " setting placeholder configuration as complete for '" + kID + "'",
+        handOverRefused(notConfigured)}, notConfigured},
+      {"setPlaceholderPromise:error:", {handOverRefused(scripted)}, scripted},
       {"initAppPlaceholderWithBundleName:bundleID:installType:client:",
-       {handOverRefused(noPlaceholder)},
-       noPlaceholder,
-       true,
-       false},
-      {"coordinatorForAppWithBundleID:withClientID:createIfNotExisting:created:error:",
-       {},
-       serviceErrorText(),
-       false,
-       false},
+       {handOverRefused(noPlaceholder)}, noPlaceholder, true, false},
+      {"coordinatorForAppWithBundleID:withClientID:createIfNotExisting:created:error:", {}, scripted, false, false},
       {nullptr, {}, "(null)", false, false},  // another client's coordinator
   };
+  // clang-format on
   for (const Case& c : cases) {
     SCOPED_TRACE(c.failing ? c.failing : "another client's coordinator");
     InstallDevice d;
@@ -383,7 +297,6 @@ std::shared_ptr<FakeKCAppInstallCoordinator> arrange(InstallDevice& d, Start sta
 }
 
 const std::string kFound = coordinatorLine(false, false);
-const std::string kForeignFound = coordinatorLine(false, false, 7);
 
 TEST(CoordinatedTransferTest, ProgressMovesTheAssetPromiseOfAUsableCoordinator) {
   const std::string progress =
@@ -396,45 +309,24 @@ TEST(CoordinatedTransferTest, ProgressMovesTheAssetPromiseOfAUsableCoordinator) 
     Messages messages;
     std::string promise;  // "PKG" stands for the package path
   };
-  const Case cases[] = {
-      {"prepared",
-       Start::kPrepared,
-       false,
-       true,
-       {kFound, progress},
-       filePromise("Asset", 0, "0.25", false, "(null)")},
-      {"no promise yet",
-       Start::kWithoutPromise,
-       false,
-       true,
-       {kFound, added, progress},
-       filePromise("Asset", 0, "0.25", false, "file://PKG")},
-      {"no promise can be made",
-       Start::kWithoutPromise,
-       true,
-       true,
-       {kFound, "[error] Error creating asset promise for 'com.example.app'", progress},
-       "(none)"},
-      {"promise complete",
-       Start::kPromiseComplete,
-       false,
-       false,
-       {kFound, "Asset promise is already satisfied for com.example.app"},
-       filePromise("Asset", 0, "0", true, "(null)")},
-      {"no coordinator", Start::kNone, false, false, {}, "(none)"},
-      {"coordinator with an error",
-       Start::kAbandoned,
-       false,
-       false,
-       {kFound},
-       filePromise("Asset", 0, "0", false, "(null)", "Error Domain=Test Code=9")},
-      {"another client's coordinator",
-       Start::kForeign,
-       false,
-       false,
-       {kForeignFound},
-       filePromise("Asset", 0, "0", false, "(null)")},
+  auto asset = [](const char* percent, bool complete, const std::string& path = "(null)",
+                  const std::string& reason = "(not cancelled)") {
+    return filePromise("Asset", 0, percent, complete, path, reason);
   };
+  // clang-format off
+  const Case cases[] = {
+      {"prepared", Start::kPrepared, false, true, {kFound, progress}, asset("0.25", false)},
+      {"no promise yet", Start::kWithoutPromise, false, true, {kFound, added, progress},
+       asset("0.25", false, "file://PKG")},
+      {"no promise can be made", Start::kWithoutPromise, true, true,
+       {kFound, "[error] Error creating asset promise for 'com.example.app'", progress}, "(none)"},
+      {"promise complete", Start::kPromiseComplete, false, false,
+       {kFound, "Asset promise is already satisfied for com.example.app"}, asset("0", true)},
+      {"no coordinator", Start::kNone, false, false, {}, "(none)"},
+      {"coordinator with an error", Start::kAbandoned, false, false, {kFound},
+       asset("0", false, "(null)", "Error Domain=Test Code=9")},
+  };
+  // clang-format on
   for (const Case& c : cases) {
     SCOPED_TRACE(c.name);
     InstallDevice d;
@@ -471,23 +363,19 @@ TEST(CoordinatedTransferTest, CompletionFulfilsThePromiseOrCancelsWithAPresentab
     Messages messages;
     Outcome outcome;
   };
+  // clang-format off
   const Case cases[] = {
       {"delivered", Start::kPrepared, false, {kFound, satisfying}, kFulfilled},
-      {"delivered without a promise",
-       Start::kWithoutPromise,
-       false,
-       {kFound, "Added app asset promise to coordinator for 'com.example.app'", satisfying},
-       kFulfilled},
-      {"promise already complete",
-       Start::kPromiseComplete,
-       false,
-       {kFound, "Asset promise is already satisfied for com.example.app"},
-       kUntouched},
+      {"delivered without a promise", Start::kWithoutPromise, false,
+       {kFound, "Added app asset promise to coordinator for 'com.example.app'", satisfying}, kFulfilled},
+      {"promise already complete", Start::kPromiseComplete, false,
+       {kFound, "Asset promise is already satisfied for com.example.app"}, kUntouched},
       {"transfer failed", Start::kPrepared, true, {kFound}, kCancelled},
       {"transfer failed, no coordinator", Start::kNone, true, {}, kUntouched},
-      {"coordinator with an error", Start::kAbandoned, false, {kFound}, kUntouched},
-      {"another client's coordinator", Start::kForeign, true, {kForeignFound}, kUntouched},
+      {"coordinator with an error", Start::kAbandoned, true, {kFound}, kUntouched},
+      {"another client's coordinator", Start::kForeign, true, {coordinatorLine(false, false, 7)}, kUntouched},
   };
+  // clang-format on
   for (const Case& c : cases) {
     SCOPED_TRACE(c.name);
     InstallDevice d;

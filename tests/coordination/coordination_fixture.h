@@ -1,5 +1,5 @@
 // A device on the coordinated road whose install-coordination service records what the client
-// asks of it, and the readers the coordination tests share.
+// obtains from it, and the readers the coordination tests share.
 #pragma once
 
 #include <gtest/gtest.h>
@@ -14,15 +14,12 @@
 #include "platform/fake/fake_platform.h"
 #include "platform/kc_wrapper.h"
 #include "restore/placeholder_fixture.h"
-#include "runtime/fs/files.h"
-#include "runtime/plist/codec.h"
-#include "support/temp_dir.h"
 
 namespace appsync::testing {
 
-// Keeps every coordinator lookup, placeholder and promise the client obtains, so that a test
-// still sees them after the service has let them go (a cancelled coordinator is forgotten).
-// Called on the test's thread only.
+// Keeps every coordinator lookup, placeholder and file promise the client obtains, so that a
+// test still sees them after the service has let them go (a cancelled coordinator is
+// forgotten). Called on the test's thread only.
 class RecordingCoordination : public KCInstallCoordinationWrapper {
  public:
   struct Lookup {
@@ -30,58 +27,32 @@ class RecordingCoordination : public KCInstallCoordinationWrapper {
     std::uint64_t client;
     bool create;
   };
-  struct Made {
-    std::string name;
-    std::uint64_t client;
-    std::optional<std::string> transferPath;
-    std::uint64_t diskSpaceNeeded;
-    std::shared_ptr<KCPromise> promise;  // null when the service refused
-  };
-  struct PresentableError {
-    std::int64_t code, detail;
-    ErrorRef underlying;
-  };
-
   using KCInstallCoordinationWrapper::KCInstallCoordinationWrapper;
 
   std::shared_ptr<KCAppInstallCoordinator> coordinatorForAppWithBundleID(
-      KCCoordinatorKind kind, const std::string& bundleID, std::uint64_t clientID,
-      bool createIfNotExisting, bool* created, ErrorRef* error) override {
-    lookups.push_back({kind, clientID, createIfNotExisting});
+      KCCoordinatorKind kind, const std::string& bundleID, std::uint64_t clientID, bool create,
+      bool* created, ErrorRef* error) override {
+    lookups.push_back({kind, clientID, create});
     auto c = staleAnswer ? staleAnswer
                          : KCInstallCoordinationWrapper::coordinatorForAppWithBundleID(
-                               kind, bundleID, clientID, createIfNotExisting, created, error);
+                               kind, bundleID, clientID, create, created, error);
     if (c) obtained.push_back(std::dynamic_pointer_cast<FakeKCAppInstallCoordinator>(c));
     return c;
   }
-  std::shared_ptr<KCPlaceholder> initAppPlaceholder(const std::string& bundleName,
-                                                    const std::string& bundleID,
+  std::shared_ptr<KCPlaceholder> initAppPlaceholder(const std::string& name, const std::string& id,
                                                     std::uint64_t installType,
                                                     std::uint64_t client) override {
-    auto p =
-        KCInstallCoordinationWrapper::initAppPlaceholder(bundleName, bundleID, installType, client);
+    auto p = KCInstallCoordinationWrapper::initAppPlaceholder(name, id, installType, client);
     if (p) placeholders.push_back(std::dynamic_pointer_cast<FakeKCPlaceholder>(p));
     return p;
   }
+  // A refused one is recorded as null.
   std::shared_ptr<KCPromisedTransferToPath> initPromisedTransferToPath(
-      const std::string& name, std::uint64_t client, const std::optional<std::string>& transferPath,
+      const std::string& name, std::uint64_t client, const std::optional<std::string>& path,
       std::uint64_t diskSpaceNeeded) override {
-    auto p = KCInstallCoordinationWrapper::initPromisedTransferToPath(name, client, transferPath,
-                                                                      diskSpaceNeeded);
-    made.push_back({name, client, transferPath, diskSpaceNeeded, p});
-    return p;
-  }
-  std::shared_ptr<KCPromisedOutOfBandTransfer> initPromisedOutOfBandTransfer(
-      const std::string& name, std::uint64_t client, std::uint64_t diskSpaceNeeded) override {
-    auto p =
-        KCInstallCoordinationWrapper::initPromisedOutOfBandTransfer(name, client, diskSpaceNeeded);
-    made.push_back({name, client, std::nullopt, diskSpaceNeeded, p});
-    return p;
-  }
-  ErrorRef KCCreateUserPresentableError(std::int64_t code, std::int64_t detail,
-                                        const ErrorRef& underlying) override {
-    presentableErrors.push_back({code, detail, underlying});
-    return KCInstallCoordinationWrapper::KCCreateUserPresentableError(code, detail, underlying);
+    made.push_back(KCInstallCoordinationWrapper::initPromisedTransferToPath(name, client, path,
+                                                                            diskSpaceNeeded));
+    return made.back();
   }
   void uninstallAppWithBundleID(const std::string& bundleID, bool requestUserConfirmation,
                                 std::function<void(ErrorRef)> completion) override {
@@ -95,16 +66,9 @@ class RecordingCoordination : public KCInstallCoordinationWrapper {
   std::vector<Lookup> lookups;
   std::vector<std::shared_ptr<FakeKCAppInstallCoordinator>> obtained;
   std::vector<std::shared_ptr<FakeKCPlaceholder>> placeholders;
-  std::vector<Made> made;
-  std::vector<PresentableError> presentableErrors;
+  std::vector<std::shared_ptr<KCPromisedTransferToPath>> made;
   std::vector<bool> uninstallConfirmations;
 };
-
-inline FakePlatform::Options coordinatedRoad() {
-  FakePlatform::Options options;
-  options.coordination = true;
-  return options;
-}
 
 // An error a scripted service call reports.
 inline ErrorRef serviceError() { return makeKCError(77, "scripted"); }
@@ -140,7 +104,7 @@ inline std::string placeholderState(const std::shared_ptr<FakeKCPlaceholder>& pl
          reasonText(placeholder->cancelReason());
 }
 
-// Hears every cancellation of a coordinator made under client 3 or 7, as
+// Hears the cancellations of coordinators made under client 3 or 7, as
 // "ID REASON by client N". Safe from the service's thread.
 class CancellationWatcher : public KCAppInstallObserverDelegate {
  public:
@@ -159,6 +123,12 @@ class CancellationWatcher : public KCAppInstallObserverDelegate {
   mutable std::mutex mutex_;
   std::vector<std::string> seen_;
 };
+
+inline FakePlatform::Options coordinatedRoad() {
+  FakePlatform::Options options;
+  options.coordination = true;
+  return options;
+}
 
 struct CoordinationDevice {
   TempDir root;
@@ -210,8 +180,8 @@ inline std::string step(int n, int phase, bool success, const std::string& id,
          (success ? "1 " : "0 ") + id + ": " + text;
 }
 
-// The message of a coordinator lookup for "com.example.app" that came back with the initiating
-// (or, for an existing app, updating) coordinator of `creator`, with no error.
+// The message of a lookup for "com.example.app" that came back with the initiating (or, for an
+// existing app, updating) coordinator of `creator`, with no error.
 inline std::string coordinatorLine(bool existingApp, bool create, std::uint64_t creator = 3) {
   const std::string kind = existingApp ? "updating" : "initiating";
   const std::string flags = "createIfNotExisting:" + std::to_string(create) +
