@@ -1,26 +1,12 @@
 // The sync road: a placeholder for an application the host has announced, so that its icon and
 // name are on the home screen while the package is on its way.
 #include "client/apps_client.h"
-#include "runtime/fs/files.h"
-#include "runtime/plist/codec.h"
 #include "platform/bundle_keys.h"
 #include "restore/placeholder_info.h"
+#include "runtime/fs/files.h"
+#include "runtime/plist/codec.h"
 
 namespace appsync {
-
-namespace {
-
-// The asset's own info property list, or an empty dictionary when it cannot be read.
-plist::Dict loadAssetInfo(const std::optional<std::string>& path) {
-  if (!path) return {};
-  std::optional<plist::Bytes> bytes = readFile(*path);
-  if (!bytes) return {};
-  std::optional<plist::Value> root = plist::parse(*bytes);
-  if (!root || !root->dict()) return {};
-  return std::move(*root->dict());
-}
-
-}  // namespace
 
 void AppsClient::_createPlaceHolderApplication(const std::shared_ptr<TRAsset>& asset) {
   if (!asset) return;
@@ -35,7 +21,8 @@ void AppsClient::_createPlaceHolderApplication(const std::shared_ptr<TRAsset>& a
   const std::optional<std::string> infoPlistPath = asset->infoPlist();
   logDefault("%s|plist %{public}@", infoPlistPath);
 
-  const plist::Dict assetInfo = loadAssetInfo(infoPlistPath);
+  const plist::Dict assetInfo =
+      infoPlistPath ? readPlistDictionary(*infoPlistPath).value_or(plist::Dict{}) : plist::Dict{};
   const plist::Value* storedGazette = assetInfo.find(kGazetteAppKey);
   const plist::Value gazette = storedGazette ? *storedGazette : plist::Value(false);
   const plist::Value* prohibited = assetInfo.find(kLaunchProhibitedKey);

@@ -2,10 +2,9 @@
 #include "runtime/fs/files.h"
 
 #include <fcntl.h>
+#include <stdio.h>  // renameat2
 #include <sys/stat.h>
 #include <unistd.h>
-
-#include <stdio.h>  // renameat2
 
 #include <algorithm>
 #include <cerrno>
@@ -250,6 +249,14 @@ bool writePlistAtomically(const std::string& path, const plist::Value& value, pl
     return false;
   }
   return writeFileAtomically(path, *bytes, error);
+}
+
+std::optional<plist::Dict> readPlistDictionary(const std::string& path) {
+  std::optional<plist::Bytes> bytes = readFile(path);
+  if (!bytes) return std::nullopt;
+  std::optional<plist::Value> root = plist::parse(*bytes);
+  if (!root || !root->dict()) return std::nullopt;
+  return std::move(*root->dict());
 }
 
 bool fileExists(const std::string& path) {

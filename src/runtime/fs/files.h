@@ -70,6 +70,10 @@ ReplaceOutcome replaceFileIfUnchanged(const std::string& path, std::span<const s
 bool writePlistAtomically(const std::string& path, const plist::Value& value, plist::Format format,
                           ErrorRef* error = nullptr);
 
+// The property list at `path` when its root is a dictionary; absent when the file is missing,
+// unreadable, not a property list or of another root type.
+std::optional<plist::Dict> readPlistDictionary(const std::string& path);
+
 bool fileExists(const std::string& path);
 bool directoryExists(const std::string& path);
 

@@ -6,8 +6,12 @@
 //   metadata, sinf, icon) -> bool, setRestoreStateProperty (app, version, key, value),
 //   restoreStateProperty (app, version, key) -> the value (no result when absent),
 //   cleanRestoreState (app), placeholderExists (app) -> bool,
-//   createPlaceHolderApplication (asset).
+//   createPlaceHolderApplication (asset), prepareAppForInstallUsingCoordination (asset,
+//   existingApp) -> bool, updateTransferProgressForApp (asset, existingApp) -> bool,
+//   transferCompleteForApp (asset, error, existingApp), assetSyncFinishedWithStatus (status,
+//   outstanding), uninstallAppUsingCoordination (app).
 #include <optional>
+#include <set>
 #include <string>
 #include <vector>
 
@@ -25,6 +29,11 @@ std::string appOf(const StepContext& c) { return c.step["app"].string(); }
 std::optional<std::string> versionOf(const StepContext& c) {
   auto field = c.step.optional("version");
   return field ? std::optional<std::string>(field->string()) : std::nullopt;
+}
+
+bool existingAppOf(const StepContext& c) {
+  auto field = c.step.optional("existingApp");
+  return field && field->boolean();
 }
 
 std::optional<plist::Bytes> optionalData(const StepContext& c, std::string_view key) {
@@ -111,6 +120,44 @@ const std::vector<ActionEntry>& pluginTable() {
        [](StepContext& s) -> ActionResult {
          auto asset = readAsset(s.step["asset"], s.session.root());
          s.session.client()._createPlaceHolderApplication(asset);
+         return std::nullopt;
+       }},
+      {"prepareAppForInstallUsingCoordination",
+       {"asset", "existingApp"},
+       [](StepContext& s) -> ActionResult {
+         auto asset = readAsset(s.step["asset"], s.session.root());
+         return plist::Value(
+             s.session.client().prepareAppForInstallUsingCoordination(asset, existingAppOf(s)));
+       }},
+      {"updateTransferProgressForApp",
+       {"asset", "existingApp"},
+       [](StepContext& s) -> ActionResult {
+         auto asset = readAsset(s.step["asset"], s.session.root());
+         return plist::Value(
+             s.session.client().updateTransferProgressForApp(asset, existingAppOf(s)));
+       }},
+      {"transferCompleteForApp",
+       {"asset", "error", "existingApp"},
+       [](StepContext& s) -> ActionResult {
+         auto asset = readAsset(s.step["asset"], s.session.root());
+         auto errorField = s.step.optional("error");
+         s.session.client().transferCompleteForApp(
+             asset, errorField ? readError(*errorField) : nullptr, existingAppOf(s));
+         return std::nullopt;
+       }},
+      {"assetSyncFinishedWithStatus",
+       {"status", "outstanding"},
+       [](StepContext& s) -> ActionResult {
+         auto outstanding = s.step["outstanding"].strings();
+         s.session.client().assetSyncFinishedWithStatus(
+             s.step["status"].boolean(),
+             std::set<std::string>(outstanding.begin(), outstanding.end()));
+         return std::nullopt;
+       }},
+      {"uninstallAppUsingCoordination",
+       {"app"},
+       [](StepContext& s) -> ActionResult {
+         s.session.client().uninstallAppUsingCoordination(appOf(s));
          return std::nullopt;
        }},
   };
