@@ -134,7 +134,8 @@ TEST(CoordinatedInstallTest, PreparationReadiesCoordinatorPromisesAndPlaceholder
     EXPECT_EQ(promiseState(d.kc.placeholders[0]->iconPromise()),
               filePromise("Icon", 8, "1", true, "file://" + target));
     EXPECT_EQ(readFile(target), kIconFile);
-    EXPECT_EQ(d.device.system().ownership(target)->owner, "mobile");
+    EXPECT_EQ(d.device.system().ownership(dir).value_or(FakeSystemServices::Ownership{}).owner,
+              "mobile");
 
     // With everything promised, the service puts the placeholder into the registry.
     d.device.kc().drain();
@@ -189,9 +190,9 @@ TEST(CoordinatedInstallTest, AFailedPreparationCancelsWhatItObtained) {
            "'";
   };
   struct Case {
-    const char* failing;  // scripted with serviceError()
-    Messages errors;      // the error-level messages, in order
-    std::string finalError;
+    const char* failing;     // scripted with serviceError()
+    Messages errors;         // the error-level messages, in order
+    std::string finalError;  // the last error the preparation's own calls got back
     bool coordinatorCancelled = true, placeholderCancelled = true;
   };
   const std::string scripted = serviceErrorText();
@@ -200,7 +201,7 @@ TEST(CoordinatedInstallTest, AFailedPreparationCancelsWhatItObtained) {
       {"setInstallOptions:error:", {e + " setting install options on coordinator for '" + kID + "'"}, scripted, true, false},
       {"setInitialSPRAssetPromises:error:", {e + " setting SPR asset promise for '" + kID + "'"}, scripted, true, false},
       {"setAppAssetPromise:error:", {e + " adding app asset promise at (null) to '" + kID + "'",
-                                     "[error] Cancelling asset promise for '" + kID + "'"}, scripted, true, false},
+                                     "[error] Cancelling asset promise for '" + kID + "'"}, "(null)", true, false},
       {"KCPromisedTransferToPath initWithName:client:diskSpaceNeeded:",
        {"[error] Error creating asset promise for '" + kID + "'"}, "(null)", true, false},
       // A placeholder whose configuration broke off is still offered; this service refuses it.
@@ -388,12 +389,13 @@ TEST(CoordinatedTransferTest, CompletionFulfilsThePromiseOrCancelsWithAPresentab
     d.client.transferCompleteForApp(asset, c.transferFailed ? transferError : nullptr, false);
 
     EXPECT_EQ(d.logged(), c.messages);
-    EXPECT_EQ(d.kc.presentableErrors.size(), c.outcome == kCancelled ? 1u : 0u);
+    EXPECT_EQ(d.device.kc().callCount("KCCreateUserPresentableError"),
+              c.outcome == kCancelled ? 1u : 0u);
     const auto promise = coordinator ? coordinator->snapshot().appAssetPromise : nullptr;
     d.device.kc().drain();
     if (c.outcome == kFulfilled) {
       EXPECT_EQ(promiseState(promise), filePromise("Asset", 0, "1", true, "file://" + package));
-    } else if (coordinator) {
+    } else if (coordinator && c.outcome == kUntouched) {
       EXPECT_EQ(promiseState(promise), before);
     }
     if (c.outcome == kFulfilled && c.start == Start::kPrepared) {  // the service installs it
@@ -404,12 +406,12 @@ TEST(CoordinatedTransferTest, CompletionFulfilsThePromiseOrCancelsWithAPresentab
       EXPECT_EQ(d.device.ar().installCalls().back().path, package);
     }
     if (c.outcome == kCancelled) {
-      const auto& presentable = d.kc.presentableErrors[0];
-      EXPECT_EQ(presentable.code, 1);
-      EXPECT_EQ(presentable.detail, 0);
-      EXPECT_EQ(presentable.underlying, transferError);
-      ASSERT_TRUE(coordinator->error());
-      EXPECT_EQ(coordinator->error()->underlying, transferError);
+      // The service's presentable error: code 1, detail 0, the transfer's error beneath.
+      const ErrorRef reason = coordinator->error();
+      ASSERT_TRUE(reason);
+      EXPECT_EQ(reason->domain + " " + std::to_string(reason->code), "KCErrorDomain 1");
+      EXPECT_EQ(*reason->userInfo.find("detail"), plist::Value(0));
+      EXPECT_EQ(reason->underlying, transferError);
       EXPECT_EQ(d.cancellations.seen(),
                 Messages{kID + " " + coordinator->error()->describe() + " by client 3"});
       EXPECT_FALSE(d.device.ar().application(kID));  // its placeholder is gone again
