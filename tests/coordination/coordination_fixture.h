@@ -19,7 +19,8 @@ namespace appsync::testing {
 
 // Keeps every coordinator lookup, placeholder and file promise the client obtains, so that a
 // test still sees them after the service has let them go (a cancelled coordinator is
-// forgotten). Called on the test's thread only.
+// forgotten). Coordinator events may call the service from its thread: the lists are read once
+// the service is drained.
 class RecordingCoordination : public KCInstallCoordinationWrapper {
  public:
   struct Lookup {
@@ -32,6 +33,7 @@ class RecordingCoordination : public KCInstallCoordinationWrapper {
   std::shared_ptr<KCAppInstallCoordinator> coordinatorForAppWithBundleID(
       KCCoordinatorKind kind, const std::string& bundleID, std::uint64_t clientID, bool create,
       bool* created, ErrorRef* error) override {
+    std::lock_guard lock(mutex);
     lookups.push_back({kind, clientID, create});
     auto c = staleAnswer ? staleAnswer
                          : KCInstallCoordinationWrapper::coordinatorForAppWithBundleID(
@@ -42,6 +44,7 @@ class RecordingCoordination : public KCInstallCoordinationWrapper {
   std::shared_ptr<KCPlaceholder> initAppPlaceholder(const std::string& name, const std::string& id,
                                                     std::uint64_t installType,
                                                     std::uint64_t client) override {
+    std::lock_guard lock(mutex);
     auto p = KCInstallCoordinationWrapper::initAppPlaceholder(name, id, installType, client);
     if (p) placeholders.push_back(std::dynamic_pointer_cast<FakeKCPlaceholder>(p));
     return p;
@@ -50,17 +53,22 @@ class RecordingCoordination : public KCInstallCoordinationWrapper {
   std::shared_ptr<KCPromisedTransferToPath> initPromisedTransferToPath(
       const std::string& name, std::uint64_t client, const std::optional<std::string>& path,
       std::uint64_t diskSpaceNeeded) override {
+    std::lock_guard lock(mutex);
     made.push_back(KCInstallCoordinationWrapper::initPromisedTransferToPath(name, client, path,
                                                                             diskSpaceNeeded));
     return made.back();
   }
   void uninstallAppWithBundleID(const std::string& bundleID, bool requestUserConfirmation,
                                 std::function<void(ErrorRef)> completion) override {
-    uninstallConfirmations.push_back(requestUserConfirmation);
+    {
+      std::lock_guard lock(mutex);
+      uninstallConfirmations.push_back(requestUserConfirmation);
+    }
     KCInstallCoordinationWrapper::uninstallAppWithBundleID(bundleID, requestUserConfirmation,
                                                            std::move(completion));
   }
 
+  std::mutex mutex;
   // When set, every lookup answers this coordinator (one the service has already let go of).
   std::shared_ptr<KCAppInstallCoordinator> staleAnswer;
   std::vector<Lookup> lookups;
