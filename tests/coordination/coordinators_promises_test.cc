@@ -238,17 +238,14 @@ TEST(RestorePlaceholderOperationTest, ConfiguresInOrderFromTheStoreMetadata) {
     bool launchProhibited, iconAndSinf;
     plist::Dict metadata;  // "bundleVersion" 3.1 is added
   };
+  // clang-format off
   const Case cases[] = {
       {0, 2, "Title", false, true, {{"title", "Title"}, {"itemName", "Item"}}},
       {1, 8, "Item", true, true, {{"itemName", "Item"}, {"ARApplicationLaunchProhibited", true}}},
       {2, 7, kApp, true, false, {{"launchProhibited", true}}},
-      {0,
-       2,
-       "T",
-       false,
-       true,
-       {{"title", "T"}, {"ARApplicationLaunchProhibited", false}, {"launchProhibited", true}}},
+      {0, 2, "T", false, true, {{"title", "T"}, {"ARApplicationLaunchProhibited", false}, {"launchProhibited", true}}},
   };
+  // clang-format on
   for (const Case& c : cases) {
     SCOPED_TRACE(c.displayName);
     CoordinationDevice d;
@@ -269,8 +266,9 @@ TEST(RestorePlaceholderOperationTest, ConfiguresInOrderFromTheStoreMetadata) {
                                                  "\" installType=" + std::to_string(c.installType) +
                                                  " client=3> configured (not cancelled)");
     ASSERT_TRUE(placeholder->attributes() && placeholder->metadata());
-    EXPECT_EQ(placeholder->attributes()->launchProhibited(), c.launchProhibited);
-    EXPECT_EQ(placeholder->attributes()->bundleVersion(), "3.1");
+    EXPECT_EQ(
+        "set " + placeholder->attributes()->describe() + " placeholder attributes for " + kApp,
+        attributesLine(c.launchProhibited));
     EXPECT_EQ(placeholder->metadata()->dictionary(), metadata);
     EXPECT_EQ(placeholder->sinfData(), extras ? std::optional(kSinfBytes) : std::nullopt);
     EXPECT_EQ(promiseState(placeholder->iconPromise()),
