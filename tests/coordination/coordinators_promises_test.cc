@@ -1,0 +1,369 @@
+// Coordinators, placeholders and promises as the client makes them: kinds and creators, names,
+// sizes, transfer paths and completion, configuration order, and what a failing step cancels.
+#include <gtest/gtest.h>
+
+#include "coordination/coordination_fixture.h"
+
+namespace appsync::coordinator_tests {
+namespace {
+
+using testing::CoordinationDevice;
+using testing::coordinatorLine;
+using testing::placeholderState;
+using testing::promiseState;
+using testing::reasonText;
+using testing::serviceError;
+using testing::step;
+using Messages = std::vector<std::string>;
+using Kind = KCCoordinatorKind;
+
+const std::string kApp = "com.example.app";
+const plist::Bytes kIconBytes = {0x89, 'P', 'N', 'G', 1, 2, 3};
+const plist::Bytes kSinfBytes = {9, 8, 7};
+const std::string kErr = "[error] Error " + testing::serviceErrorText();
+
+TEST(CoordinatorLookupTest, OnlyItsOwnCoordinatorOfTheAskedKindIsUsed) {
+  enum Outcome { kCreated, kFound, kForeign, kNothing };
+  struct Case {
+    const char* name;
+    std::optional<Kind> existing;
+    std::uint64_t creator;  // of the existing coordinator
+    bool existingApp, create;
+    Outcome outcome;
+    std::int64_t errorCode = 0;  // of the error out-parameter; 0: none
+    bool scriptFailure = false;
+  };
+  const Case cases[] = {
+      {"new initiating", {}, 3, false, true, kCreated},
+      {"new updating", {}, 3, true, true, kCreated},
+      {"existing, not creating", Kind::Initiating, 3, false, false, kFound},
+      {"existing updating, creating", Kind::Updating, 3, true, true, kFound},
+      {"another client's", Kind::Initiating, 7, false, true, kForeign},
+      {"another client's updating", Kind::Updating, 1, true, false, kForeign},
+      {"one of another kind", Kind::Updating, 3, false, true, kNothing,
+       kKCErrorCoordinatorKindMismatch},
+      {"none, not creating", {}, 3, false, false, kNothing},
+      {"service fails", {}, 3, true, true, kNothing, 77, true},
+  };
+  for (const Case& c : cases) {
+    SCOPED_TRACE(c.name);
+    CoordinationDevice d;
+    auto existing = c.existing ? d.put(*c.existing, kApp, c.creator) : nullptr;
+    if (c.scriptFailure) {
+      d.device.kc().failOperation(
+          "coordinatorForAppWithBundleID:withClientID:createIfNotExisting:created:error:",
+          serviceError());
+    }
+    ErrorRef error = makeError("Untouched", 1);
+    // The out-parameter is optional: a foreign coordinator is also refused without one.
+    ErrorRef* out = c.outcome == kForeign && c.existingApp ? nullptr : &error;
+
+    auto result = d.client._initiatingOrUpdatingAppInstallCoordinatorForBundleIdentifier(
+        kApp, c.existingApp, c.create, out);
+
+    const bool returned = c.outcome == kCreated || c.outcome == kFound;
+    const Kind asked = c.existingApp ? Kind::Updating : Kind::Initiating;
+    ASSERT_EQ(result != nullptr, returned);
+    if (returned) {
+      EXPECT_EQ(result->kind(), asked);
+      EXPECT_EQ(result->creatorIdentifier(), 3u);
+      EXPECT_EQ(result, d.device.kc().coordinator(kApp));
+      if (existing) {
+        EXPECT_EQ(result, existing);
+      }
+    } else if (existing) {  // left as it was, still the service's
+      EXPECT_EQ(existing->state(), FakeKCAppInstallCoordinator::State::Active);
+      EXPECT_EQ(d.device.kc().coordinator(kApp), existing);
+    } else {
+      EXPECT_FALSE(d.device.kc().coordinator(kApp));
+    }
+    ASSERT_EQ(d.kc.lookups.size(), 1u);
+    EXPECT_EQ(d.kc.lookups[0].kind, asked);
+    EXPECT_EQ(d.kc.lookups[0].client, 3u);
+    EXPECT_EQ(d.kc.lookups[0].create, c.create);
+    if (out) {
+      EXPECT_EQ(error ? error->code : 0, c.errorCode) << reasonText(error);
+    }
+    const bool logged = c.outcome != kNothing;
+    EXPECT_EQ(d.logged(),
+              logged ? Messages{coordinatorLine(c.existingApp, c.create, c.creator)} : Messages{});
+    EXPECT_EQ(d.steps(), (Messages{step(3, 1, true, kApp, "Create coordinator"),
+                                   step(3, 2, returned, kApp, "Finished creating coordinator")}));
+  }
+}
+
+TEST(CoordinatorPlaceholderTest, PlaceholderAndUserDataPromiseAreMadeUnderClient3) {
+  for (bool refused : {false, true}) {
+    SCOPED_TRACE(refused);
+    CoordinationDevice d;
+    if (refused) {
+      d.device.kc().failOperation("initAppPlaceholderWithBundleName:bundleID:installType:client:");
+      d.device.kc().failOperation(
+          "KCPromisedOutOfBandTransfer initWithName:client:diskSpaceNeeded:");
+    }
+    auto placeholder = d.client._placeHolderForBundleIdentifier(kApp, "Name", 8);
+    auto userData = d.client._userDataPromiseForBundleIdentifier(kApp);
+
+    const std::string made =
+        "<KCPlaceholder bundleID=com.example.app name=\"Name\" installType=8 client=3>";
+    EXPECT_EQ(placeholderState(std::dynamic_pointer_cast<FakeKCPlaceholder>(placeholder)),
+              refused ? "(none)" : made + " unconfigured (not cancelled)");
+    EXPECT_EQ(promiseState(userData),
+              refused ? "(none)"
+                      : "<KCPromisedOutOfBandTransfer name=com.example.app-UserData client=3 "
+                        "diskSpaceNeeded=0 percentComplete=1 complete=YES cancelled=NO> "
+                        "(not cancelled)");
+    EXPECT_EQ(d.logged(), Messages{"Created placeholder " + (refused ? "(null)" : made) +
+                                   " for 'com.example.app' of type 8"});
+    EXPECT_EQ(d.steps(), (Messages{step(4, 1, true, kApp, "Create placeholder"),
+                                   step(4, 2, !refused, kApp, "Finished creating placeholder")}));
+  }
+}
+
+TEST(CoordinatorPromiseTest, IconPromiseIsCompleteAndCancelledForItsRoadWhenRefused) {
+  const std::string refused = kErr + " adding icon promise to placeholder for '" + kApp + "'";
+  auto icon = [](const std::string& reason = "(not cancelled)") {
+    return testing::filePromise("Icon", 4096, "1", true, "file:///icons/Icon.png", reason);
+  };
+  struct Case {
+    const char* name;
+    bool placeholder;
+    const char* failing;
+    bool forAppInstall;
+    Messages messages;
+    std::string promise;  // the promise made, whether or not it is returned
+  };
+  // clang-format off
+  const Case cases[] = {
+      {"attached", true, nullptr, true, {"Added icon promise to placeholder for '" + kApp + "'"}, icon()},
+      {"no placeholder", false, nullptr, true,
+       {"[error] Placeholder to add icon promise is nil for '" + kApp + "'"}, "(none)"},
+      {"not made", true, "KCPromisedTransferToPath initWithName:client:transferPath:diskSpaceNeeded:",
+       true, {}, "(none)"},
+      {"refused, app install", true, "setIconPromise:error:", true, {refused}, icon("Error Domain=TRError Code=30")},
+      {"refused, restore", true, "setIconPromise:error:", false, {refused}, icon("Error Domain=TRError Code=29")},
+  };
+  // clang-format on
+  for (const Case& c : cases) {
+    SCOPED_TRACE(c.name);
+    CoordinationDevice d;
+    auto placeholder = c.placeholder ? std::dynamic_pointer_cast<FakeKCPlaceholder>(
+                                           d.device.kc().initAppPlaceholder("N", kApp, 4, 3))
+                                     : nullptr;
+    if (c.failing) d.device.kc().failOperation(c.failing, serviceError());
+
+    auto promise = d.client._createIconPromiseForBundleIdentifier(kApp, "/icons/Icon.png", 4096,
+                                                                  placeholder, c.forAppInstall);
+
+    EXPECT_EQ(promise != nullptr, c.placeholder && !c.failing);
+    EXPECT_EQ(d.logged(), c.messages);
+    EXPECT_EQ(d.kc.made.size(), c.placeholder ? 1u : 0u);
+    EXPECT_EQ(promiseState(d.kc.made.empty() ? nullptr : d.kc.made[0]), c.promise);
+    if (placeholder) {
+      EXPECT_EQ(placeholder->iconPromise(), promise);
+    }
+  }
+}
+
+TEST(CoordinatorPromiseTest, AssetPromiseWaitsForThePackageAndIsCancelledWhenRefused) {
+  const std::string path = "/packages/Sample.app", url = "file://" + path;
+  const std::string added = "Added app asset promise to coordinator for '" + kApp + "'";
+  auto asset = [](const std::string& at, const std::string& reason = "(not cancelled)") {
+    return testing::filePromise("Asset", 0, "0", false, at, reason);
+  };
+  struct Case {
+    const char* name;
+    bool withPath, coordinator;
+    const char* failing;
+    Messages messages;
+    std::string promise;
+  };
+  // clang-format off
+  const Case cases[] = {
+      {"with a path", true, true, nullptr, {added}, asset(url)},
+      {"without a path", false, true, nullptr, {added}, asset("(null)")},
+      {"no coordinator", true, false, nullptr, {}, "(none)"},
+      {"not made", false, true, "KCPromisedTransferToPath initWithName:client:diskSpaceNeeded:",
+       {"[error] Error creating asset promise for '" + kApp + "'"}, "(none)"},
+      {"refused", true, true, "setAppAssetPromise:error:",
+       {kErr + " adding app asset promise at " + path + " to '" + kApp + "'",
+        "[error] Cancelling asset promise for '" + kApp + "'"}, asset(url, "Error Domain=TRError Code=30")},
+  };
+  // clang-format on
+  for (const Case& c : cases) {
+    SCOPED_TRACE(c.name);
+    CoordinationDevice d;
+    auto coordinator = c.coordinator ? d.put(Kind::Initiating, kApp) : nullptr;
+    if (c.failing) d.device.kc().failOperation(c.failing, serviceError());
+
+    auto promise = d.client._createAppAssetPromiseForBundleIdentifier(
+        kApp, c.withPath ? std::optional(path) : std::nullopt, coordinator);
+
+    EXPECT_EQ(promise != nullptr, c.coordinator && !c.failing);
+    EXPECT_EQ(d.logged(), c.messages);
+    EXPECT_EQ(d.kc.made.size(), c.coordinator ? 1u : 0u);
+    EXPECT_EQ(promiseState(d.kc.made.empty() ? nullptr : d.kc.made[0]), c.promise);
+    if (coordinator) {
+      EXPECT_EQ(coordinator->snapshot().appAssetPromise, promise);
+    }
+  }
+}
+
+std::string placeholderLine(const std::string& name, int type) {
+  return "Created placeholder <KCPlaceholder bundleID=com.example.app name=\"" + name +
+         "\" installType=" + std::to_string(type) + " client=3> for 'com.example.app' of type " +
+         std::to_string(type);
+}
+
+std::string attributesLine(bool launchProhibited) {
+  KCPlaceholderAttributes attributes;
+  attributes.setLaunchProhibited(launchProhibited);
+  attributes.setBundleVersion("3.1");
+  return "set " + attributes.describe() + " placeholder attributes for com.example.app";
+}
+
+// The messages of the placeholder directory and the icon written into it.
+Messages directoryLines(const std::string& dir, bool icon) {
+  return {"Created app directory for 'com.example.app' at " + dir + " with err=(null)",
+          icon ? "icon data for 'com.example.app' was writen to " + dir +
+                     "/Icon.png with status:1 fileSize:7"
+               : "[error] no icon data for 'com.example.app'"};
+}
+
+TEST(RestorePlaceholderOperationTest, ConfiguresInOrderFromTheStoreMetadata) {
+  struct Case {
+    std::uint64_t demotion;
+    int installType;
+    std::string displayName;
+    bool launchProhibited, iconAndSinf;
+    plist::Dict metadata;  // "bundleVersion" 3.1 is added
+  };
+  // clang-format off
+  const Case cases[] = {
+      {0, 2, "Title", false, true, {{"title", "Title"}, {"itemName", "Item"}}},
+      {1, 8, "Item", true, true, {{"itemName", "Item"}, {"ARApplicationLaunchProhibited", true}}},
+      {2, 7, kApp, true, false, {{"launchProhibited", true}}},
+      {0, 2, "T", false, true, {{"title", "T"}, {"ARApplicationLaunchProhibited", false}, {"launchProhibited", true}}},
+  };
+  // clang-format on
+  for (const Case& c : cases) {
+    SCOPED_TRACE(c.displayName);
+    CoordinationDevice d;
+    plist::Dict metadata = c.metadata;
+    metadata.set("bundleVersion", "3.1");
+    const std::string dir = d.placeholderDir(kApp), icon = dir + "/Icon.png";
+    const bool extras = c.iconAndSinf;
+
+    auto result = d.client._placeHolderForBundleIdentifier(
+        kApp, metadata, extras ? std::optional(kSinfBytes) : std::nullopt,
+        extras ? std::optional(kIconBytes) : std::nullopt, c.demotion);
+
+    ASSERT_EQ(d.kc.placeholders.size(), 1u);
+    auto placeholder = d.kc.placeholders[0];
+    EXPECT_EQ(result, placeholder);
+    EXPECT_EQ(placeholderState(placeholder), "<KCPlaceholder bundleID=com.example.app name=\"" +
+                                                 c.displayName +
+                                                 "\" installType=" + std::to_string(c.installType) +
+                                                 " client=3> configured (not cancelled)");
+    ASSERT_TRUE(placeholder->attributes() && placeholder->metadata());
+    EXPECT_EQ(
+        "set " + placeholder->attributes()->describe() + " placeholder attributes for " + kApp,
+        attributesLine(c.launchProhibited));
+    EXPECT_EQ(placeholder->metadata()->dictionary(), metadata);
+    EXPECT_EQ(placeholder->sinfData(), extras ? std::optional(kSinfBytes) : std::nullopt);
+    EXPECT_EQ(promiseState(placeholder->iconPromise()),
+              extras ? testing::filePromise("Icon", 7, "1", true, "file://" + icon) : "(none)");
+    EXPECT_EQ(d.kc.made.size(), extras ? 1u : 0u);
+    for (const std::string& path : {dir, icon}) {
+      auto owner = d.device.system().ownership(path);
+      EXPECT_EQ(owner ? owner->owner + ":" + owner->group : "",
+                extras || path == dir ? "mobile:mobile" : "");
+    }
+
+    Messages expected = directoryLines(dir, extras);
+    expected.push_back(placeholderLine(c.displayName, c.installType));
+    if (extras) expected.push_back("Added icon promise to placeholder for '" + kApp + "'");
+    expected.push_back(attributesLine(c.launchProhibited));
+    expected.push_back("set store metadata on placeholder for com.example.app");
+    if (extras) expected.push_back("set SINF data on placeholder for com.example.app");
+    expected.push_back("set placeholder configuration complete for com.example.app");
+    EXPECT_EQ(d.logged(), expected);
+    EXPECT_EQ(d.steps(), (Messages{step(4, 1, true, kApp, "Create placeholder"),
+                                   step(4, 2, true, kApp, "Finished creating placeholder")}));
+  }
+}
+
+TEST(RestorePlaceholderOperationTest, AFailingStepCancelsWith29AndKeepsTheFiles) {
+  const std::string made = placeholderLine("T", 2);
+  const std::string iconAdded = "Added icon promise to placeholder for '" + kApp + "'";
+  const std::string attributesSet = attributesLine(false);
+  const std::string metadataSet = "set store metadata on placeholder for com.example.app";
+  struct Case {
+    const char* failing;
+    Messages tail;  // after the directory and icon messages
+  };
+  const Case cases[] = {
+      {"initAppPlaceholderWithBundleName:bundleID:installType:client:",
+       {"Created placeholder (null) for 'com.example.app' of type 2"}},
+      {"KCPromisedTransferToPath initWithName:client:transferPath:diskSpaceNeeded:", {made}},
+      {"setIconPromise:error:",
+       {made, kErr + " adding icon promise to placeholder for 'com.example.app'"}},
+      {"setPlaceholderAttributes:error:",
+       {made, iconAdded, kErr + " setting placeholder attributes for 'com.example.app'"}},
+      {"setMetadata:error:",
+       {made, iconAdded, attributesSet, kErr + " setting store metadata for 'com.example.app'"}},
+      {"setSinfData:error:",
+       {made, iconAdded, attributesSet, metadataSet,
+        kErr + " setting SINF data for 'com.example.app'"}},
+      {"setConfigurationCompleteWithError:",
+       {made, iconAdded, attributesSet, metadataSet,
+        "set SINF data on placeholder for com.example.app",
+        kErr + " setting placeholder configuration as complete for 'com.example.app'"}},
+  };
+  for (const Case& c : cases) {
+    SCOPED_TRACE(c.failing);
+    CoordinationDevice d;
+    d.device.kc().failOperation(c.failing, serviceError());
+    const std::string dir = d.placeholderDir(kApp);
+    const plist::Dict metadata{{"title", "T"}, {"bundleVersion", "3.1"}};
+
+    EXPECT_FALSE(
+        d.client._placeHolderForBundleIdentifier(kApp, metadata, kSinfBytes, kIconBytes, 0));
+
+    Messages expected = directoryLines(dir, true);
+    expected.insert(expected.end(), c.tail.begin(), c.tail.end());
+    EXPECT_EQ(d.logged(), expected);
+    const std::string reason = "Error Domain=TRError Code=29";
+    EXPECT_EQ(d.device.kc().callCount("KCPlaceholder cancelForReason:client:error:"),
+              d.kc.placeholders.size());
+    for (const auto& placeholder : d.kc.placeholders) {
+      EXPECT_EQ(reasonText(placeholder->cancelReason()), reason);
+    }
+    for (const auto& promise : d.kc.made) {
+      if (promise) {
+        EXPECT_EQ(reasonText(dynamic_cast<FakeKCPromiseBase&>(*promise).cancelReason()), reason);
+      }
+    }
+    EXPECT_EQ(readFile(dir + "/Icon.png"), kIconBytes);
+  }
+}
+
+TEST(RestorePlaceholderOperationTest, NoDirectoryMeansNothingAtTheService) {
+  CoordinationDevice d;
+  ASSERT_TRUE(writeFileAtomically(d.appsDir(), plist::Bytes{'x'}));
+  EXPECT_FALSE(
+      d.client._placeHolderForBundleIdentifier(kApp, {{"title", "T"}}, kSinfBytes, kIconBytes, 0));
+  EXPECT_EQ(
+      d.device.kc().callCount("initAppPlaceholderWithBundleName:bundleID:installType:client:"), 0u);
+  EXPECT_TRUE(d.kc.made.empty());
+  EXPECT_TRUE(d.steps().empty());
+  const Messages logged = d.logged();
+  ASSERT_EQ(logged.size(), 1u);
+  EXPECT_TRUE(logged[0].starts_with("Created app directory for 'com.example.app' at " +
+                                    d.placeholderDir(kApp) +
+                                    " with err=Error Domain=POSIX Code=20"))
+      << logged[0];
+}
+
+}  // namespace
+}  // namespace appsync::coordinator_tests
