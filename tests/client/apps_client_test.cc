@@ -35,27 +35,6 @@ FakePlatform::Options insideHostDaemon(bool coordination = true) {
   return options;
 }
 
-TEST(AppsClientTest, ConstructionRegistersInitialisesAndChoosesTheRoad) {
-  for (bool coordination : {false, true}) {
-    SCOPED_TRACE(coordination);
-    testing::TempDir root;
-    FakePlatform::Options options;
-    options.coordination = coordination;
-    FakePlatform device(root.path(), options);
-    {
-      AppsClient client(device.platform());
-      EXPECT_EQ(client.useInstallCoordinator(), coordination);
-      EXPECT_EQ(device.ar().observerCount(), 1u);
-      auto logs = device.transactionLog().initializeCalls();
-      ASSERT_EQ(logs.size(), 1u);
-      EXPECT_EQ(logs[0]->subsystem, "com.vantor.appinstallation");
-      EXPECT_EQ(logs[0]->category, "trc.appsync");
-      EXPECT_EQ(client.supportedDataclasses(), std::vector<std::string>{"Application"});
-    }
-    EXPECT_EQ(device.ar().observerCount(), 0u);
-  }
-}
-
 // What a service sees of the client at the moment the client registers with it.
 struct SeenAtRegistration {
   bool registered = false;
@@ -89,6 +68,8 @@ class WatchedSystem : public SystemServicesWrapper {
   SeenAtRegistration seen;
 };
 
+// Construction registers with the services, initialises the transaction log and chooses the
+// road; the services see a whole client when it registers, and teardown unregisters.
 TEST(AppsClientTest, ServicesSeeAWholeClientWhenItRegisters) {
   for (bool coordination : {false, true}) {
     for (bool host : {false, true}) {
@@ -102,7 +83,18 @@ TEST(AppsClientTest, ServicesSeeAWholeClientWhenItRegisters) {
           }());
       WatchedRegistry registry(device.ar());
       WatchedSystem system(device.system());
-      AppsClient client(device.platform().with(registry).with(system));
+      {
+        AppsClient client(device.platform().with(registry).with(system));
+        EXPECT_EQ(client.useInstallCoordinator(), coordination);
+        EXPECT_EQ(device.ar().observerCount(), 1u);
+        EXPECT_EQ(device.system().notificationObserverCount(), host ? 1u : 0u);
+        auto logs = device.transactionLog().initializeCalls();
+        ASSERT_EQ(logs.size(), 1u);
+        EXPECT_EQ(logs[0]->subsystem, "com.vantor.appinstallation");
+        EXPECT_EQ(logs[0]->category, "trc.appsync");
+      }
+      EXPECT_EQ(device.ar().observerCount(), 0u);
+      EXPECT_EQ(device.system().notificationObserverCount(), 0u);
       EXPECT_TRUE(registry.seen.registered);
       EXPECT_EQ(registry.seen.useInstallCoordinator, coordination);
       EXPECT_EQ(registry.seen.finishedWaiting, host);
@@ -227,8 +219,6 @@ TEST(AppsClientTest, OutsideTheHostDaemonNoStartupHandshakeHappens) {
   testing::TempDir root;
   FakePlatform device(root.path());
   AppsClient client(device.platform());
-  EXPECT_FALSE(client.finishedWaitingForPlaceHolderInstalls());
-  EXPECT_EQ(device.system().notificationObserverCount(), 0u);
   device.system().postNotification("com.vantor.trc.TRStartupCompleteNotification");
   EXPECT_FALSE(client.hasInstallCoordinatorObserver());
   EXPECT_EQ(device.kc().callCount("initWithMachServiceName:forClients:delegate:"), 0u);
@@ -237,22 +227,17 @@ TEST(AppsClientTest, OutsideTheHostDaemonNoStartupHandshakeHappens) {
 TEST(AppsClientTest, InsideTheHostDaemonStartupCreatesTheObserverOnce) {
   testing::TempDir root;
   FakePlatform device(root.path(), insideHostDaemon());
-  {
-    AppsClient client(device.platform());
-    EXPECT_TRUE(client.finishedWaitingForPlaceHolderInstalls());
-    EXPECT_EQ(device.system().notificationObserverCount(), 1u);
-    EXPECT_FALSE(client.hasInstallCoordinatorObserver());
+  AppsClient client(device.platform());
+  EXPECT_FALSE(client.hasInstallCoordinatorObserver());
 
-    device.system().postNotification("com.vantor.trc.TRStartupCompleteNotification");
-    EXPECT_TRUE(client.hasInstallCoordinatorObserver());
-    device.system().postNotification("com.vantor.trc.TRStartupCompleteNotification");
-    EXPECT_EQ(device.kc().callCount("initWithMachServiceName:forClients:delegate:"), 1u);
+  device.system().postNotification("com.vantor.trc.TRStartupCompleteNotification");
+  EXPECT_TRUE(client.hasInstallCoordinatorObserver());
+  device.system().postNotification("com.vantor.trc.TRStartupCompleteNotification");
+  EXPECT_EQ(device.kc().callCount("initWithMachServiceName:forClients:delegate:"), 1u);
 
-    // Other notifications are not the start-up notification.
-    device.system().postNotification("com.vantor.trc.SomethingElse");
-    EXPECT_EQ(device.kc().callCount("initWithMachServiceName:forClients:delegate:"), 1u);
-  }
-  EXPECT_EQ(device.system().notificationObserverCount(), 0u);
+  // Other notifications are not the start-up notification.
+  device.system().postNotification("com.vantor.trc.SomethingElse");
+  EXPECT_EQ(device.kc().callCount("initWithMachServiceName:forClients:delegate:"), 1u);
 }
 
 TEST(AppsClientTest, StartupCallbackWithoutObserverDoesNothing) {

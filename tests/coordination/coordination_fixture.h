@@ -35,11 +35,9 @@ class RecordingCoordination : public KCInstallCoordinationWrapper {
       bool* created, ErrorRef* error) override {
     std::lock_guard lock(mutex);
     lookups.push_back({kind, clientID, create});
-    auto c = staleAnswer ? staleAnswer
-                         : KCInstallCoordinationWrapper::coordinatorForAppWithBundleID(
-                               kind, bundleID, clientID, create, created, error);
-    if (c) obtained.push_back(std::dynamic_pointer_cast<FakeKCAppInstallCoordinator>(c));
-    return c;
+    return staleAnswer ? staleAnswer
+                       : KCInstallCoordinationWrapper::coordinatorForAppWithBundleID(
+                             kind, bundleID, clientID, create, created, error);
   }
   std::shared_ptr<KCPlaceholder> initAppPlaceholder(const std::string& name, const std::string& id,
                                                     std::uint64_t installType,
@@ -72,7 +70,6 @@ class RecordingCoordination : public KCInstallCoordinationWrapper {
   // When set, every lookup answers this coordinator (one the service has already let go of).
   std::shared_ptr<KCAppInstallCoordinator> staleAnswer;
   std::vector<Lookup> lookups;
-  std::vector<std::shared_ptr<FakeKCAppInstallCoordinator>> obtained;
   std::vector<std::shared_ptr<FakeKCPlaceholder>> placeholders;
   std::vector<std::shared_ptr<KCPromisedTransferToPath>> made;
   std::vector<bool> uninstallConfirmations;
@@ -174,7 +171,6 @@ struct CoordinationDevice {
   std::string placeholderDir(const std::string& id) {
     return client.placeholderAppPathForBundleIdentifier(id).value_or("(none)");
   }
-  std::string appsDir() const { return root / "tmp/com.vantor.trc.Apps"; }
   std::shared_ptr<FakeKCAppInstallCoordinator> put(KCCoordinatorKind kind, const std::string& id,
                                                    std::uint64_t creator = 3) {
     return device.kc().putCoordinator(kind, id, creator);

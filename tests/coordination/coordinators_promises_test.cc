@@ -34,7 +34,6 @@ TEST(CoordinatorLookupTest, OnlyItsOwnCoordinatorOfTheAskedKindIsUsed) {
     bool scriptFailure = false;
   };
   const Case cases[] = {
-      {"new initiating", {}, 3, false, true, kCreated},
       {"new updating", {}, 3, true, true, kCreated},
       {"existing, not creating", Kind::Initiating, 3, false, false, kFound},
       {"existing updating, creating", Kind::Updating, 3, true, true, kFound},
@@ -120,91 +119,64 @@ TEST(CoordinatorPlaceholderTest, PlaceholderAndUserDataPromiseAreMadeUnderClient
   }
 }
 
-TEST(CoordinatorPromiseTest, IconPromiseIsCompleteAndCancelledForItsRoadWhenRefused) {
-  const std::string refused = kErr + " adding icon promise to placeholder for '" + kApp + "'";
-  auto icon = [](const std::string& reason = "(not cancelled)") {
+// Promises that are made and attached are shown by the preparation; here are the ways they are
+// not, and the reason a refused one is cancelled with (30 on the app-install road, 29 on restore).
+TEST(CoordinatorPromiseTest, APromiseNotAttachedIsCancelledForItsRoad) {
+  const std::string path = "/packages/Sample.app";
+  auto icon = [](const std::string& reason) {
     return testing::filePromise("Icon", 4096, "1", true, "file:///icons/Icon.png", reason);
   };
+  const std::string iconRefused = kErr + " adding icon promise to placeholder for '" + kApp + "'";
   struct Case {
     const char* name;
-    bool placeholder;
+    bool asset, holder;  // an asset promise (else an icon promise); its coordinator or placeholder
     const char* failing;
     bool forAppInstall;
     Messages messages;
-    std::string promise;  // the promise made, whether or not it is returned
+    std::string promise;  // the promise made, though not returned
   };
   // clang-format off
   const Case cases[] = {
-      {"attached", true, nullptr, true, {"Added icon promise to placeholder for '" + kApp + "'"}, icon()},
-      {"no placeholder", false, nullptr, true,
+      {"icon, no placeholder", false, false, nullptr, true,
        {"[error] Placeholder to add icon promise is nil for '" + kApp + "'"}, "(none)"},
-      {"not made", true, "KCPromisedTransferToPath initWithName:client:transferPath:diskSpaceNeeded:",
+      {"icon not made", false, true, "KCPromisedTransferToPath initWithName:client:transferPath:diskSpaceNeeded:",
        true, {}, "(none)"},
-      {"refused, app install", true, "setIconPromise:error:", true, {refused}, icon("Error Domain=TRError Code=30")},
-      {"refused, restore", true, "setIconPromise:error:", false, {refused}, icon("Error Domain=TRError Code=29")},
-  };
-  // clang-format on
-  for (const Case& c : cases) {
-    SCOPED_TRACE(c.name);
-    CoordinationDevice d;
-    auto placeholder = c.placeholder ? std::dynamic_pointer_cast<FakeKCPlaceholder>(
-                                           d.device.kc().initAppPlaceholder("N", kApp, 4, 3))
-                                     : nullptr;
-    if (c.failing) d.device.kc().failOperation(c.failing, serviceError());
-
-    auto promise = d.client._createIconPromiseForBundleIdentifier(kApp, "/icons/Icon.png", 4096,
-                                                                  placeholder, c.forAppInstall);
-
-    EXPECT_EQ(promise != nullptr, c.placeholder && !c.failing);
-    EXPECT_EQ(d.logged(), c.messages);
-    EXPECT_EQ(d.kc.made.size(), c.placeholder ? 1u : 0u);
-    EXPECT_EQ(promiseState(d.kc.made.empty() ? nullptr : d.kc.made[0]), c.promise);
-    if (placeholder) {
-      EXPECT_EQ(placeholder->iconPromise(), promise);
-    }
-  }
-}
-
-TEST(CoordinatorPromiseTest, AssetPromiseWaitsForThePackageAndIsCancelledWhenRefused) {
-  const std::string path = "/packages/Sample.app", url = "file://" + path;
-  const std::string added = "Added app asset promise to coordinator for '" + kApp + "'";
-  auto asset = [](const std::string& at, const std::string& reason = "(not cancelled)") {
-    return testing::filePromise("Asset", 0, "0", false, at, reason);
-  };
-  struct Case {
-    const char* name;
-    bool withPath, coordinator;
-    const char* failing;
-    Messages messages;
-    std::string promise;
-  };
-  // clang-format off
-  const Case cases[] = {
-      {"with a path", true, true, nullptr, {added}, asset(url)},
-      {"without a path", false, true, nullptr, {added}, asset("(null)")},
-      {"no coordinator", true, false, nullptr, {}, "(none)"},
-      {"not made", false, true, "KCPromisedTransferToPath initWithName:client:diskSpaceNeeded:",
-       {"[error] Error creating asset promise for '" + kApp + "'"}, "(none)"},
-      {"refused", true, true, "setAppAssetPromise:error:",
+      {"icon refused, app install", false, true, "setIconPromise:error:", true, {iconRefused},
+       icon("Error Domain=TRError Code=30")},
+      {"icon refused, restore", false, true, "setIconPromise:error:", false, {iconRefused},
+       icon("Error Domain=TRError Code=29")},
+      {"asset, no coordinator", true, false, nullptr, true, {}, "(none)"},
+      {"asset not made", true, true, "KCPromisedTransferToPath initWithName:client:transferPath:diskSpaceNeeded:",
+       true, {"[error] Error creating asset promise for '" + kApp + "'"}, "(none)"},
+      {"asset refused", true, true, "setAppAssetPromise:error:", true,
        {kErr + " adding app asset promise at " + path + " to '" + kApp + "'",
-        "[error] Cancelling asset promise for '" + kApp + "'"}, asset(url, "Error Domain=TRError Code=30")},
+        "[error] Cancelling asset promise for '" + kApp + "'"},
+       testing::filePromise("Asset", 0, "0", false, "file://" + path, "Error Domain=TRError Code=30")},
   };
   // clang-format on
   for (const Case& c : cases) {
     SCOPED_TRACE(c.name);
     CoordinationDevice d;
-    auto coordinator = c.coordinator ? d.put(Kind::Initiating, kApp) : nullptr;
+    auto coordinator = c.asset && c.holder ? d.put(Kind::Initiating, kApp) : nullptr;
+    auto placeholder = !c.asset && c.holder ? std::dynamic_pointer_cast<FakeKCPlaceholder>(
+                                                  d.device.kc().initAppPlaceholder("N", kApp, 4, 3))
+                                            : nullptr;
     if (c.failing) d.device.kc().failOperation(c.failing, serviceError());
 
-    auto promise = d.client._createAppAssetPromiseForBundleIdentifier(
-        kApp, c.withPath ? std::optional(path) : std::nullopt, coordinator);
+    auto promise = c.asset
+                       ? d.client._createAppAssetPromiseForBundleIdentifier(kApp, path, coordinator)
+                       : d.client._createIconPromiseForBundleIdentifier(
+                             kApp, "/icons/Icon.png", 4096, placeholder, c.forAppInstall);
 
-    EXPECT_EQ(promise != nullptr, c.coordinator && !c.failing);
+    EXPECT_FALSE(promise);
     EXPECT_EQ(d.logged(), c.messages);
-    EXPECT_EQ(d.kc.made.size(), c.coordinator ? 1u : 0u);
+    EXPECT_EQ(d.kc.made.size(), c.holder ? 1u : 0u);
     EXPECT_EQ(promiseState(d.kc.made.empty() ? nullptr : d.kc.made[0]), c.promise);
     if (coordinator) {
-      EXPECT_EQ(coordinator->snapshot().appAssetPromise, promise);
+      EXPECT_FALSE(coordinator->snapshot().appAssetPromise);
+    }
+    if (placeholder) {
+      EXPECT_FALSE(placeholder->iconPromise());
     }
   }
 }
@@ -350,7 +322,7 @@ TEST(RestorePlaceholderOperationTest, AFailingStepCancelsWith29AndKeepsTheFiles)
 
 TEST(RestorePlaceholderOperationTest, NoDirectoryMeansNothingAtTheService) {
   CoordinationDevice d;
-  ASSERT_TRUE(writeFileAtomically(d.appsDir(), plist::Bytes{'x'}));
+  ASSERT_TRUE(writeFileAtomically(d.root / "tmp/com.vantor.trc.Apps", plist::Bytes{'x'}));
   EXPECT_FALSE(
       d.client._placeHolderForBundleIdentifier(kApp, {{"title", "T"}}, kSinfBytes, kIconBytes, 0));
   EXPECT_EQ(
