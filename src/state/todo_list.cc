@@ -1,6 +1,8 @@
 // The todo-list writer: load (or reuse what was last written), change in place, rewrite whole.
 #include "state/todo_list.h"
 
+#include <algorithm>
+
 #include "runtime/fs/files.h"
 #include "runtime/plist/codec.h"
 #include "state/loaders.h"
@@ -17,6 +19,21 @@ bool identifierMatches(const plist::Value& record, std::string_view identifier) 
 }
 
 }  // namespace
+
+bool isValidAssetPath(const plist::Value* value) {
+  const std::string* text = value ? value->string() : nullptr;
+  return text && text->find("/..") == std::string::npos;
+}
+
+bool isValidApplicationIdentifier(const plist::Value* value) {
+  if (!isValidAssetPath(value)) return false;
+  const std::string& text = *value->string();
+  if (text.empty() || text == "." || text == "..") return false;
+  return std::none_of(text.begin(), text.end(), [](char c) {
+    const auto byte = static_cast<unsigned char>(c);
+    return c == '/' || byte < 0x20 || byte == 0x7f;
+  });
+}
 
 const plist::Dict* findTodoRecord(const plist::Array& list, std::string_view identifier) {
   for (const plist::Value& record : list) {
@@ -105,9 +122,9 @@ void TodoList::applyBatch(const std::vector<Change>& batch) {
     plist::Value root(std::move(*list));
     std::optional<plist::Bytes> bytes = plist::writeBinary(root);
     list = std::move(*root.array());
-    ReplaceOutcome outcome =
-        bytes ? replaceFileIfUnchanged(path_, *bytes, identity, &cachedIdentity_)
-              : ReplaceOutcome::Failed;
+    ReplaceOutcome outcome = bytes
+                                 ? replaceFileIfUnchanged(path_, *bytes, identity, &cachedIdentity_)
+                                 : ReplaceOutcome::Failed;
     if (outcome == ReplaceOutcome::Changed) continue;
     ++rewrites_;
     for (const std::string& message : messages) log.write(LogLevel::Default, message);
