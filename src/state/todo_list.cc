@@ -122,9 +122,9 @@ void TodoList::applyBatch(const std::vector<Change>& batch) {
     plist::Value root(std::move(*list));
     std::optional<plist::Bytes> bytes = plist::writeBinary(root);
     list = std::move(*root.array());
-    ReplaceOutcome outcome = bytes
-                                 ? replaceFileIfUnchanged(path_, *bytes, identity, &cachedIdentity_)
-                                 : ReplaceOutcome::Failed;
+    ReplaceOutcome outcome =
+        bytes ? replaceFileIfUnchanged(path_, *bytes, identity, &cachedIdentity_)
+              : ReplaceOutcome::Failed;
     if (outcome == ReplaceOutcome::Changed) continue;
     ++rewrites_;
     for (const std::string& message : messages) log.write(LogLevel::Default, message);

@@ -5,11 +5,11 @@
 #include <system_error>
 #include <utility>
 
-#include "platform/ar.h"
-#include "platform/bundle_keys.h"
 #include "runtime/fs/files.h"
 #include "runtime/fs/paths.h"
 #include "runtime/plist/codec.h"
+#include "platform/ar.h"
+#include "platform/bundle_keys.h"
 
 namespace appsync::fake_ar {
 
