@@ -87,6 +87,26 @@ class AppsClient : public TRClient,
     return loadDemotedAppsList(tr, path, error);
   }
 
+  // ---- Inventory of vanished apps (sync/installed_assets.cc) ----------------------------------
+  // {"_Deleted": [{"BNBundleIdentifier": ID}, ...]}: the apps the installer lists as uninstalled
+  // and the last-sync apps no longer installed, except those the previous sync's todo list still
+  // works on. Replaces _uninstalledApps when the installer answers.
+  plist::Dict installedAssets() override;
+
+  // ---- Reconciliation (sync/reconcile.cc) ------------------------------------------------------
+  // Takes the host's staging area over as the sync folder, performs the todo list's removals,
+  // tells the home screen that a sync starts and hands it the icon layout. False (and *error)
+  // only when the work area cannot be made or the staging area cannot be taken over.
+  bool reconcileSync(std::uint32_t syncType, const std::string& newAnchor,
+                     ProgressCallback progressCallback, ErrorRef* error) override;
+
+  // ---- Sync end and clearing (sync/sync_end.cc) ------------------------------------------------
+  // After a successful sync: stamps the work area, clears from the installer exactly the apps
+  // installedAssets reported, removes the last-sync list. After a failed one: nothing.
+  void syncEndedWithSuccess(bool success) override;
+  // Removes the work area, every placeholder app, and the installer's whole uninstalled list.
+  void clearSyncData() override;
+
   // ---- Todo states (sync/todo_states.cc) -----------------------------------------------------
   // Records `toDo` as the "operation" of the first todo record of `assetID`. Any thread.
   void changeAssetID(const std::string& assetID, const std::string& toDo);
@@ -149,9 +169,8 @@ class AppsClient : public TRClient,
   // `andAddToPlaceHolder`; cancelled (30 for an app install, 29 for a restore) when it cannot
   // be attached.
   std::shared_ptr<KCPromisedTransferToPath> _createIconPromiseForBundleIdentifier(
-      const std::string& bundleID, const std::string& transferPath,
-      std::uint64_t diskSpaceNeeded, const std::shared_ptr<KCPlaceholder>& andAddToPlaceHolder,
-      bool forAppInstall);
+      const std::string& bundleID, const std::string& transferPath, std::uint64_t diskSpaceNeeded,
+      const std::shared_ptr<KCPlaceholder>& andAddToPlaceHolder, bool forAppInstall);
   // The incomplete asset promise "ID-Asset" (with a transfer path when `atPath` is given),
   // attached to the coordinator; cancelled with 30 when it cannot be attached.
   std::shared_ptr<KCPromisedTransferToPath> _createAppAssetPromiseForBundleIdentifier(
@@ -225,6 +244,14 @@ class AppsClient : public TRClient,
   void logError(std::string_view format, const Args&... args) const {
     pluginLog(platform_.tr.TRGetLogCategory(kAppSyncLogCategory), LogLevel::Error, format, args...);
   }
+
+  // Reconciliation's steps (sync/reconcile.cc).
+  // Removes the previous sync folder, makes the work area and moves the staging area into it as
+  // the sync folder. False (and *error) when the work area cannot be made or the staging area
+  // cannot be taken over; *nothingStaged is set when there is no staging area.
+  bool _replaceSyncFolderWithStagingArea(ErrorRef* error, bool* nothingStaged);
+  // Removes the apps the todo list's "remove" records name, on the client's road.
+  void _performDeletions(const plist::Array& toDoList);
 
   const Platform platform_;
 

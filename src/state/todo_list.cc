@@ -1,6 +1,8 @@
 // The todo-list writer: load (or reuse what was last written), change in place, rewrite whole.
 #include "state/todo_list.h"
 
+#include <algorithm>
+
 #include "runtime/fs/files.h"
 #include "runtime/plist/codec.h"
 #include "state/loaders.h"
@@ -17,6 +19,21 @@ bool identifierMatches(const plist::Value& record, std::string_view identifier) 
 }
 
 }  // namespace
+
+bool isValidAssetPath(const plist::Value* value) {
+  const std::string* text = value ? value->string() : nullptr;
+  return text && text->find("/..") == std::string::npos;
+}
+
+bool isValidApplicationIdentifier(const plist::Value* value) {
+  if (!isValidAssetPath(value)) return false;
+  const std::string& text = *value->string();
+  if (text.empty() || text == "." || text == "..") return false;
+  return std::none_of(text.begin(), text.end(), [](char c) {
+    const auto byte = static_cast<unsigned char>(c);
+    return c == '/' || byte < 0x20 || byte == 0x7f;
+  });
+}
 
 const plist::Dict* findTodoRecord(const plist::Array& list, std::string_view identifier) {
   for (const plist::Value& record : list) {

@@ -29,6 +29,15 @@ inline constexpr std::string_view kTodoDownloaded = "DOWNLOADED";
 inline constexpr std::string_view kTodoInstalled = "INSTALLED";
 inline constexpr std::string_view kTodoFailed = "FAILED";
 
+// The host's own test of a todo record's identifier or of a delivered package path: present, a
+// string, and without "/.." in it.
+bool isValidAssetPath(const plist::Value* value);
+// Whether a todo record's identifier may be acted upon: it passes isValidAssetPath and can name
+// one application, that is one path component of its own (not empty, ".", ".." or absolute, no
+// "/", no NUL, newline or other control character). "../x" passes the host's test but is no
+// application; acting on it could reach outside the directory it is joined to.
+bool isValidApplicationIdentifier(const plist::Value* value);
+
 // The first record of `list` whose "identifier" equals `identifier` (records that are not
 // dictionaries never match); null when there is none.
 const plist::Dict* findTodoRecord(const plist::Array& list, std::string_view identifier);

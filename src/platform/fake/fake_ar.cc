@@ -88,7 +88,7 @@ bool FakeARWorkspace::removeApplication(const std::string& identifier) {
   return true;
 }
 
-void FakeARWorkspace::setUninstallHook(std::function<void(const std::string&)> hook) {
+void FakeARWorkspace::setUninstallHook(UninstallHook hook) {
   std::lock_guard lock(mutex_);
   uninstallHook_ = std::move(hook);
 }

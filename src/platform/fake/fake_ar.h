@@ -108,8 +108,10 @@ class FakeARWorkspace final : public ARApplicationWorkspace, public FakeService 
   // Bounds of a zip package (defaults in ArchiveLimits: 1 GiB unpacked, 65,536 entries).
   void setArchiveLimits(fake_ar::ArchiveLimits limits);
 
-  // Called with the identifier after every successful uninstall, outside the registry's lock.
-  void setUninstallHook(std::function<void(const std::string&)> hook);
+  // Called with the removed record after every successful uninstall, outside the registry's
+  // lock.
+  using UninstallHook = std::function<void(const AppRecord& removed)>;
+  void setUninstallHook(UninstallHook hook);
 
   // The container a package install uses for `identifier` (absent for one that would escape).
   std::optional<std::string> containerDirectoryFor(const std::string& identifier) const;
@@ -237,7 +239,7 @@ class FakeARWorkspace final : public ARApplicationWorkspace, public FakeService 
   std::vector<std::string> paused_;
   std::vector<std::pair<std::uint64_t, ARApplicationWorkspaceObserverProtocol*>> observers_;
   std::uint64_t nextRegistration_ = 1;
-  std::function<void(const std::string&)> uninstallHook_;
+  UninstallHook uninstallHook_;
   fake_ar::ArchiveLimits archiveLimits_;
   CallbackThread callbacks_{"fake-ar-events"};  // last: stops first
 };

@@ -1,14 +1,13 @@
 // The fake application registry's installs and uninstalls: placeholder and package installs
 // into containers under the device root, removal, the calls made, and the events they cause.
-#include "platform/fake/fake_ar.h"
-
 #include <system_error>
 #include <utility>
 
-#include "runtime/fs/files.h"
 #include "platform/bundle_keys.h"
+#include "platform/fake/fake_ar.h"
 #include "platform/fake/fake_ar_bundle_files.h"
 #include "platform/fake/fake_ar_package_archive.h"
+#include "runtime/fs/files.h"
 
 namespace appsync {
 
@@ -43,8 +42,8 @@ bool FakeARWorkspace::uninstallApplication(const std::string& identifier,
   }
   std::vector<std::uint64_t> registrations;
   ARProxyList removed;
-  std::optional<std::string> container;
-  std::function<void(const std::string&)> hook;
+  std::optional<AppRecord> removedRecord;
+  UninstallHook hook;
   bool succeeded = false;
   {
     std::lock_guard lock(mutex_);
@@ -52,7 +51,7 @@ bool FakeARWorkspace::uninstallApplication(const std::string& identifier,
     if (!failed && e && e->record.isApplication && (!placeholdersOnly || e->record.isPlaceholder)) {
       succeeded = true;
       removed.push_back(makeApplicationProxy(*e));
-      container = e->record.containerDirectory;
+      removedRecord = e->record;
       eraseLocked(identifier);
       registrations = registrationsLocked();
       hook = uninstallHook_;
@@ -61,9 +60,10 @@ bool FakeARWorkspace::uninstallApplication(const std::string& identifier,
   }
   if (!succeeded) return false;
   // Only containers this registry made are removed; a placeholder's own directory is not ours.
+  const std::optional<std::string>& container = removedRecord->containerDirectory;
   const std::optional<std::string> ours = containerDirectoryFor(identifier);
   if (container && ours && *container == *ours) removeAll(*container);
-  if (hook) hook(identifier);
+  if (hook) hook(*removedRecord);
   postEvent(std::move(registrations),
             &ARApplicationWorkspaceObserverProtocol::applicationsDidUninstall, std::move(removed));
   return true;

@@ -24,8 +24,15 @@ FakePlatform::FakePlatform(std::filesystem::path root, Options options)
       kc_(ar_),
       system_(root, *clock_),
       platform_{tr_, ar_, kc_, em_, sw_, rs_, bz_, pv_, qi_, transactionLog_, system_, paths_} {
-  // Uninstalling an application puts it on the installer's list of uninstalled applications.
-  ar_.setUninstallHook([this](const std::string& identifier) { em_.addUninstalled(identifier); });
+  // The installer lists the applications that left the device: an installed application's
+  // removal counts, whoever asked for it (the host's removals on either road included). A
+  // placeholder's does not: placeholders are what the client and the coordination service clean
+  // up (clearing sync data, a failed restore install, a cancelled install), and none of them is
+  // an application the host saw on the device. The user's own removal is listed by the user
+  // action itself, placeholder or not (see the simulator's remove-app).
+  ar_.setUninstallHook([this](const FakeARWorkspace::AppRecord& removed) {
+    if (!removed.isPlaceholder) em_.addUninstalled(removed.identifier);
+  });
   kc_.setCoordinationEnabled(options.coordination);
   system_.setMainBundleIdentifier(options.mainBundleIdentifier);
 }

@@ -85,6 +85,10 @@ void checkFile(const YamlField& step) {
     if (!exists->boolean() && step.has("plist")) exists->fail("a missing file has no contents");
   }
   if (auto contents = step.optional("plist")) contents->plist();
+  if (auto format = step.optional("format")) {
+    checkChoice(*format, {"binary", "xml"});
+    if (step.has("exists") && !step["exists"].boolean()) format->fail("a missing file has no format");
+  }
 }
 
 std::optional<std::string> evaluateFile(DeviceSession& session, const YamlField& step,
@@ -95,13 +99,21 @@ std::optional<std::string> evaluateFile(DeviceSession& session, const YamlField&
   const bool exists = fs::exists(fs::symlink_status(path, ec));
   const bool wanted = !step.has("exists") || step["exists"].boolean();
   if (exists != wanted) return relative + (exists ? " exists" : " does not exist");
-  if (!step.has("plist")) return std::nullopt;
+  if (!step.has("plist") && !step.has("format")) return std::nullopt;
   ErrorRef error;
   auto bytes = readFile(path.string(), &error);
   if (!bytes) return relative + ": cannot read: " + error->describe();
   plist::ParseError parseError;
-  auto found = plist::parse(*bytes, &parseError);
+  plist::Format format = plist::Format::Binary;
+  auto found = plist::parse(*bytes, &parseError, &format);
   if (!found) return relative + " is not a property list: " + parseError.message;
+  if (auto wanted = step.optional("format")) {
+    const std::string written = format == plist::Format::Binary ? "binary" : "xml";
+    if (wanted->string() != written) {
+      return relative + ": expected a " + wanted->string() + " property list, found " + written;
+    }
+  }
+  if (!step.has("plist")) return std::nullopt;
   if (auto difference = firstDifference(step["plist"].plist(), *found)) {
     return relative + ": " + *difference;
   }
@@ -433,7 +445,7 @@ struct Kind {
 
 const std::vector<Kind>& kinds() {
   static const std::vector<Kind> table = {
-      {"file", {"path", "exists", "plist"}, checkFile, evaluateFile},
+      {"file", {"path", "exists", "plist", "format"}, checkFile, evaluateFile},
       {"log", {"category", "level", "text", "contains", "present", "since"}, checkLog, evaluateLog},
       {"todo", {"app", "state", "absent"}, checkTodo, evaluateTodo},
       {"registry",
