@@ -102,8 +102,8 @@ bool AppsClient::respondsTo(TRClientOperation operation) const {
   // The optional operations this client implements; the others abort when called.
   static const std::set<TRClientOperation> kImplemented = {
       TRClientOperation::installedAssetMetrics, TRClientOperation::vantorIDsForAssets,
-      TRClientOperation::accountsForAssets, TRClientOperation::disabledAssetTypes,
-      TRClientOperation::prepareForBackup};
+      TRClientOperation::accountsForAssets,     TRClientOperation::disabledAssetTypes,
+      TRClientOperation::prepareForBackup,      TRClientOperation::outstandingAssetTransfers};
   return kImplemented.count(operation) > 0;
 }
 
