@@ -149,8 +149,9 @@ class AppsClient : public TRClient,
   // `andAddToPlaceHolder`; cancelled (30 for an app install, 29 for a restore) when it cannot
   // be attached.
   std::shared_ptr<KCPromisedTransferToPath> _createIconPromiseForBundleIdentifier(
-      const std::string& bundleID, const std::string& transferPath, std::uint64_t diskSpaceNeeded,
-      const std::shared_ptr<KCPlaceholder>& andAddToPlaceHolder, bool forAppInstall);
+      const std::string& bundleID, const std::string& transferPath,
+      std::uint64_t diskSpaceNeeded, const std::shared_ptr<KCPlaceholder>& andAddToPlaceHolder,
+      bool forAppInstall);
   // The incomplete asset promise "ID-Asset" (with a transfer path when `atPath` is given),
   // attached to the coordinator; cancelled with 30 when it cannot be attached.
   std::shared_ptr<KCPromisedTransferToPath> _createAppAssetPromiseForBundleIdentifier(
