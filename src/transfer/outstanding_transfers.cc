@@ -125,6 +125,9 @@ std::vector<std::shared_ptr<TRAsset>> AppsClient::outstandingAssetTransfers() {
 
   // 3. The todo list's installs.
   std::set<std::string> requested;
+  // Identifiers whose folder was found to stay inside the sync folder: a list may name one
+  // many times, and resolving links costs system calls.
+  std::set<std::string> confinedIdentifiers;
   for (const plist::Value& item : todoList.value_or(plist::Array{})) {
     const plist::Dict* record = item.dict();
     if (!record) continue;
@@ -135,9 +138,14 @@ std::vector<std::shared_ptr<TRAsset>> AppsClient::outstandingAssetTransfers() {
     // would leave it, directly or through a link, is refused the same way.
     std::optional<std::string> packageDirectory;
     if (isValidAssetPath(identifierValue)) {
-      packageDirectory = paths.packageDirectory(*identifierValue->string());
-      if (packageDirectory && !resolvesInside(*packageDirectory, paths.syncFolder())) {
-        packageDirectory.reset();
+      const std::string& name = *identifierValue->string();
+      packageDirectory = paths.packageDirectory(name);
+      if (packageDirectory && confinedIdentifiers.count(name) == 0) {
+        if (resolvesInside(*packageDirectory, paths.syncFolder())) {
+          confinedIdentifiers.insert(name);
+        } else {
+          packageDirectory.reset();
+        }
       }
     }
     if (!packageDirectory) {
