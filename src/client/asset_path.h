@@ -17,8 +17,10 @@ bool isValidAssetPath(const plist::Value* object);
 bool isValidAssetPath(const std::optional<std::string>& object);
 bool isValidAssetPath(std::string_view object);
 
-// True when `path`, with every symbolic link on it that exists resolved, lies inside `base`
-// (also resolved). A folder of the host's staging area that is a link leading elsewhere fails.
-bool resolvesInside(const std::string& path, const std::string& base);
+// True when `base`/`name`, with every symbolic link on it that exists resolved, lies inside
+// `base` (also resolved). A folder of the host's staging area that is a link leading elsewhere
+// fails. `name` is relative. Links are resolved only when `name` passes through one, so the
+// common case costs one lstat per component of `name`.
+bool resolvesInside(const std::string& base, std::string_view name);
 
 }  // namespace appsync

@@ -125,8 +125,9 @@ std::vector<std::shared_ptr<TRAsset>> AppsClient::outstandingAssetTransfers() {
 
   // 3. The todo list's installs.
   std::set<std::string> requested;
+  const std::string syncFolder = paths.syncFolder();
   // Identifiers whose folder was found to stay inside the sync folder: a list may name one
-  // many times, and resolving links costs system calls.
+  // many times.
   std::set<std::string> confinedIdentifiers;
   for (const plist::Value& item : todoList.value_or(plist::Array{})) {
     const plist::Dict* record = item.dict();
@@ -141,7 +142,7 @@ std::vector<std::shared_ptr<TRAsset>> AppsClient::outstandingAssetTransfers() {
       const std::string& name = *identifierValue->string();
       packageDirectory = paths.packageDirectory(name);
       if (packageDirectory && confinedIdentifiers.count(name) == 0) {
-        if (resolvesInside(*packageDirectory, paths.syncFolder())) {
+        if (resolvesInside(syncFolder, name)) {
           confinedIdentifiers.insert(name);
         } else {
           packageDirectory.reset();
