@@ -98,8 +98,7 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
       std::error_code ec;
       if (index < 7 && (flags >> (index + 1) & 1)) {
         fs::create_directory_symlink(outside() / "Evil.app", folder, ec);
-      } else {
-        fs::create_directory(folder, ec);
+      } else if (fs::create_directory(folder, ec)) {  // a name given twice is made once
         writePlistAtomically((folder / "Info.plist").string(),
                              plist::Dict{{"BNBundleIdentifier", std::string(name)},
                                          {"BNBundleDisplayName", "Fuzzed"}},
@@ -115,7 +114,15 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
     device.kc().drain();
   }
 
-  if (snapshot(outside()) != outsideBefore) fuzz::fail("a file outside the root changed");
+  for (const auto& [path, facts] : snapshot(outside())) {
+    auto before = outsideBefore.find(path);
+    if (before == outsideBefore.end() || before->second != facts) {
+      fuzz::fail("a file outside the root changed", path);
+    }
+  }
+  if (snapshot(outside()).size() != outsideBefore.size()) {
+    fuzz::fail("a file outside the root went away");
+  }
   std::error_code ec;
   for (const auto& entry : fs::directory_iterator(base, ec)) {
     if (entry.path() != root && entry.path() != outside()) {
