@@ -105,7 +105,7 @@ bool AppsClient::respondsTo(TRClientOperation operation) const {
       TRClientOperation::syncEndedWithSuccess,  TRClientOperation::clearSyncData,
       TRClientOperation::installedAssetMetrics, TRClientOperation::vantorIDsForAssets,
       TRClientOperation::accountsForAssets,     TRClientOperation::disabledAssetTypes,
-      TRClientOperation::prepareForBackup};
+      TRClientOperation::prepareForBackup,      TRClientOperation::outstandingAssetTransfers};
   return kImplemented.count(operation) > 0;
 }
 

@@ -212,6 +212,12 @@ class AppsClient : public TRClient,
   void _enumeratePlaceholdersWithBlock(const ProxyBlock& block);
   std::set<std::string> _getSystemAppPlaceholders();
 
+  // ---- Outstanding transfers (transfer/outstanding_transfers.cc) ------------------------------
+  // The packages the host is to send, in download order: the todo list's installs and the
+  // placeholders on the device, less the installs the registry already runs and what the skip
+  // rules leave out; each readied on the client's road. Not on _accessQueue.
+  std::vector<std::shared_ptr<TRAsset>> outstandingAssetTransfers() override;
+
   // ---- Reporting (reporting/) ----------------------------------------------------------------
   // {"_Count", "_PhysicalSize", "_PurgeableSize"} of the user's installed applications.
   plist::Dict installedAssetMetrics() override;
@@ -274,7 +280,7 @@ class AppsClient : public TRClient,
   // The backup service's manager, kept for the client's lifetime.
   std::shared_ptr<SWManager> _backupManager;
   // Apps whose transfer updates an installed app. Guard: _accessQueue. Writers: outstanding
-  // transfers (add), transfer completion (remove, empty).
+  // transfers (add, coordinated road), transfer completion (remove, empty).
   std::set<std::string> _updatingApps;
   // Apps whose install the user cancelled. Guard: _accessQueue. Writers: coordinator events
   // (add), transfer completion (remove, empty).

@@ -50,6 +50,8 @@ namespace appsync {
 // - Install options carrying store metadata (ARCaravelMetadataKey, bytes of a property list)
 //   are written to the container as "CaravelMetadata.plist", as the registry keeps them; a
 //   placeholder install with metadata gets a container for it.
+// - The installs reported as prioritized and paused follow what the registry holds (see
+//   setInstallsInProgress).
 // - A proxy's installProgressSync is the progress object most recently handed out for the
 //   application (installProgressForApplication or installProgress below) until a package
 //   install completes it, or the application is removed.
@@ -127,8 +129,12 @@ class FakeARWorkspace final : public ARApplicationWorkspace, public FakeService 
   std::vector<InstallCall> installCalls() const;
   std::vector<UninstallCall> uninstallCalls() const;
 
-  // The installs the registry reports as prioritized and paused, by identifier (identifiers
-  // without a record are left out of the reports). Each report carries fresh proxies.
+  // The registry reports as prioritized what it holds that is being installed: every
+  // application whose current install progress is waiting or active, and every restore
+  // placeholder (install type 2) without one, which awaits its data; as paused every application
+  // whose current progress is paused. Finished, failed and cancelled installs are in neither.
+  // These identifiers are reported as well, after those (identifiers without a record are left
+  // out). Each report carries fresh proxies, in record order.
   void setInstallsInProgress(std::vector<std::string> prioritized, std::vector<std::string> paused);
   // Delivers applicationInstallsArePrioritized with the current lists to every observer.
   void notifyInstallsArePrioritized();
@@ -206,6 +212,8 @@ class FakeARWorkspace final : public ARApplicationWorkspace, public FakeService 
   std::shared_ptr<ARInstallProgress> progressLocked(const std::string& identifier,
                                                     std::uint64_t phase);
   ARProxyList proxiesLocked(const std::vector<std::string>& identifiers) const;
+  // The prioritized and paused installs as reported (see setInstallsInProgress).
+  void installsInProgressLocked(ARProxyList* prioritized, ARProxyList* paused) const;
   std::vector<std::uint64_t> registrationsLocked() const;
 
   static std::shared_ptr<const ARBundleProxy> makeProxy(const Entry& entry);

@@ -1,5 +1,7 @@
-// The fake application registry's observers: registration, and events delivered on the
-// registry's callback thread to observers still registered.
+// The fake application registry's observers: registration, the installs it reports as
+// prioritized and paused, and events delivered on the registry's callback thread to observers
+// still registered.
+#include <algorithm>
 #include <utility>
 
 #include "platform/fake/fake_ar.h"
@@ -10,6 +12,34 @@ std::vector<std::uint64_t> FakeARWorkspace::registrationsLocked() const {
   std::vector<std::uint64_t> out;
   for (const auto& [registration, observer] : observers_) out.push_back(registration);
   return out;
+}
+
+void FakeARWorkspace::installsInProgressLocked(ARProxyList* prioritized,
+                                               ARProxyList* paused) const {
+  std::vector<std::string> running, waiting;
+  for (const Entry& e : entries_) {
+    if (!e.record.isApplication) continue;
+    if (e.currentProgress) {
+      const std::uint64_t state = e.currentProgress->installState();
+      if (state == ARInstallStateWaiting || state == ARInstallStateActive) {
+        running.push_back(e.record.identifier);
+      } else if (state == ARInstallStatePaused) {
+        waiting.push_back(e.record.identifier);
+      }
+    } else if (e.record.isPlaceholder && e.record.installType == ARInstallTypeRestore) {
+      running.push_back(e.record.identifier);  // a restore placeholder awaits its data
+    }
+  }
+  // What a test added by hand follows, once.
+  auto addScripted = [](std::vector<std::string>& list, const std::vector<std::string>& extra) {
+    for (const std::string& identifier : extra) {
+      if (std::find(list.begin(), list.end(), identifier) == list.end()) list.push_back(identifier);
+    }
+  };
+  addScripted(running, prioritized_);
+  addScripted(waiting, paused_);
+  *prioritized = proxiesLocked(running);
+  *paused = proxiesLocked(waiting);
 }
 
 ARApplicationWorkspaceObserverProtocol* FakeARWorkspace::observerFor(
@@ -54,8 +84,7 @@ void FakeARWorkspace::addObserver(ARApplicationWorkspaceObserverProtocol* observ
     std::lock_guard lock(mutex_);
     registration = nextRegistration_++;
     observers_.emplace_back(registration, observer);
-    prioritized = proxiesLocked(prioritized_);
-    paused = proxiesLocked(paused_);
+    installsInProgressLocked(&prioritized, &paused);
   }
   postPrioritized({registration}, std::move(prioritized), std::move(paused));
 }
@@ -89,8 +118,7 @@ void FakeARWorkspace::notifyInstallsArePrioritized() {
   {
     std::lock_guard lock(mutex_);
     registrations = registrationsLocked();
-    prioritized = proxiesLocked(prioritized_);
-    paused = proxiesLocked(paused_);
+    installsInProgressLocked(&prioritized, &paused);
   }
   postPrioritized(std::move(registrations), std::move(prioritized), std::move(paused));
 }

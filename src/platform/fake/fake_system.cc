@@ -9,6 +9,9 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <map>
+#include <mutex>
+#include <utility>
 #include <vector>
 
 #include "runtime/fs/files.h"
@@ -47,6 +50,24 @@ std::optional<gid_t> groupID(const std::string& name) {
     return std::nullopt;
   }
   return found->gr_gid;
+}
+
+// The user and group IDs of the accounts, looked up once per process: each lookup goes through
+// the host's account services (a few dozen file opens), and the accounts do not change while
+// the process runs.
+std::optional<std::pair<uid_t, gid_t>> accountIDs(const std::string& owner,
+                                                  const std::string& group) {
+  static std::mutex mutex;
+  static std::map<std::pair<std::string, std::string>, std::optional<std::pair<uid_t, gid_t>>>
+      known;
+  std::lock_guard lock(mutex);
+  auto [it, inserted] = known.try_emplace({owner, group});
+  if (inserted) {
+    std::optional<uid_t> uid = userID(owner);
+    std::optional<gid_t> gid = groupID(group);
+    if (uid && gid) it->second = std::make_pair(*uid, *gid);
+  }
+  return it->second;
 }
 
 }  // namespace
@@ -232,10 +253,8 @@ bool FakeSystemServices::setOwnerAndGroup(const std::string& path, const std::st
     setError(error, failure);
     ok = false;
   } else {
-    std::optional<uid_t> uid = userID(owner);
-    std::optional<gid_t> gid = groupID(group);
-    if (uid && gid) {
-      if (::chown(path.c_str(), *uid, *gid) == 0) {
+    if (std::optional<std::pair<uid_t, gid_t>> ids = accountIDs(owner, group)) {
+      if (::chown(path.c_str(), ids->first, ids->second) == 0) {
         record.applied = true;
       } else {
         setError(error, makePOSIXError(errno, path));

@@ -132,11 +132,25 @@ void checkLog(const YamlField& step) {
   if (auto since = step.optional("since")) checkChoice(*since, {"start", "step"});
 }
 
-std::optional<std::string> evaluateLog(DeviceSession&, const YamlField& step,
+// The text with every "{root}" replaced by the device root, so that a message naming a device
+// path can be matched whole.
+std::string withDeviceRoot(std::string text, const fs::path& root) {
+  static constexpr std::string_view kRootMark = "{root}";
+  std::string rootText = root.string();
+  while (rootText.size() > 1 && rootText.back() == '/') rootText.pop_back();
+  for (std::size_t at = text.find(kRootMark); at != std::string::npos;
+       at = text.find(kRootMark, at + rootText.size())) {
+    text.replace(at, kRootMark.size(), rootText);
+  }
+  return text;
+}
+
+std::optional<std::string> evaluateLog(DeviceSession& session, const YamlField& step,
                                        const ReplayOutput& output) {
   const auto& lines = sinceStep(step) ? output.lastStep.log : output.sinceStart.log;
   const bool exact = step.has("text");
-  const std::string text = exact ? step["text"].string() : step["contains"].string();
+  const std::string text =
+      withDeviceRoot(exact ? step["text"].string() : step["contains"].string(), session.root());
   auto category = step.optional("category");
   auto level = step.optional("level");
   const auto matches = [&](const MemoryLogSink::Line& line) {

@@ -1,7 +1,7 @@
 // `platform: KIND`: a change of the device's platform between the client's calls: scripted
 // failures of a service's operation (and their end), the home screen refusing termination
-// assertions, restrictions, the user installing or removing an app on the device, and the data
-// the backup holds for an app.
+// assertions, restrictions, the user installing or removing an app on the device, an install the
+// registry runs, and the data the backup holds for an app.
 #include <cstdint>
 #include <string>
 #include <vector>
@@ -151,6 +151,29 @@ ActionResult removeApp(StepContext& s) {
   return std::nullopt;
 }
 
+// The registry runs an install of an app it holds: the app's current install progress gets the
+// phase and the state named, so the registry reports it among its prioritized or paused installs.
+ActionResult installProgress(StepContext& s) {
+  static const std::vector<std::string> kStates = {"waiting",  "active", "paused",
+                                                   "canceled", "failed", "finished"};
+  static const std::vector<std::string> kPhases = {"loading", "installing", "restoring-data",
+                                                   "installing-placeholder"};
+  auto codeOf = [](const YamlField& field, const std::vector<std::string>& names) {
+    const std::string text = field.string();
+    for (std::size_t i = 0; i < names.size(); ++i) {
+      if (names[i] == text) return static_cast<std::uint64_t>(i);
+    }
+    field.fail("unknown value \"" + text + "\" (expected one of: " + joinNames(names) + ")");
+  };
+  const std::string app = s.step["app"].string();
+  const std::uint64_t state = codeOf(s.step["state"], kStates);
+  const std::uint64_t phase = codeOf(s.step["phase"], kPhases);
+  std::shared_ptr<ARInstallProgress> progress = s.session.device().ar().installProgress(app, phase);
+  if (!progress) throw StepFailed("the registry holds no application " + app);
+  progress->setInstallState(state);
+  return std::nullopt;
+}
+
 // The data the backup holds for an app: a size in bytes, or none.
 ActionResult backupData(StepContext& s) {
   const std::string app = s.step["app"].string();
@@ -172,6 +195,7 @@ const std::vector<ActionEntry>& platformTable() {
       {"install-app", {"identifier", "name", "version", "storeMetadata"}, installApp},
       {"remove-app", {"app"}, removeApp},
       {"backup-data", {"app", "size"}, backupData},
+      {"install-progress", {"app", "state", "phase"}, installProgress},
   };
   return table;
 }

@@ -93,6 +93,10 @@ const std::vector<ActionEntry>& pluginTable() {
        [](StepContext& s) -> ActionResult {
          std::string bundleID = appOf(s);
          plist::Value value = s.step["value"].plist();
+         // A recorded download path is a path handed to the client: resolved under the root.
+         if (s.step["key"].string() == "path" && value.string()) {
+           value = plist::Value(clientPath(s.session.root(), *value.string()));
+         }
          s.session.client()._setRestoreStatePropertyValue(value, s.step["key"].string(), bundleID,
                                                           versionOf(s));
          return std::nullopt;
@@ -101,8 +105,12 @@ const std::vector<ActionEntry>& pluginTable() {
        {"app", "version", "key"},
        [](StepContext& s) -> ActionResult {
          std::string bundleID = appOf(s);
-         return s.session.client()._restoreStatePropertyForKey(s.step["key"].string(), bundleID,
-                                                               versionOf(s));
+         std::optional<plist::Value> value = s.session.client()._restoreStatePropertyForKey(
+             s.step["key"].string(), bundleID, versionOf(s));
+         if (value && value->string() && s.step["key"].string() == "path") {
+           value = plist::Value(shownPath(s.session.root(), *value->string()));
+         }
+         return value;
        }},
       {"cleanRestoreState",
        {"app"},
