@@ -2,6 +2,9 @@
 #include "platform/fake/fake_pv.h"
 
 #include <cstring>
+#include <optional>
+#include <string>
+#include <vector>
 
 #include "runtime/plist/codec.h"
 
@@ -27,6 +30,34 @@ class FakeAssertion final : public PVSAssertion {
   std::string bundleID_;
   std::shared_ptr<std::atomic<std::size_t>> live_;
 };
+
+// The identifiers of a layout, page by page, in order: the strings of an array of pages (each an
+// array of identifiers, or of folders that are arrays themselves). Absent when the bytes are
+// not such a property list.
+std::optional<std::vector<std::string>> flattenLayout(const plist::Bytes& bytes) {
+  std::optional<plist::Value> layout = plist::parse(bytes);
+  if (!layout || !layout->array()) return std::nullopt;
+  std::vector<std::string> identifiers;
+  std::vector<const plist::Array*> pending{layout->array()};
+  std::vector<std::size_t> positions{0};
+  while (!pending.empty()) {
+    const plist::Array& current = *pending.back();
+    std::size_t& position = positions.back();
+    if (position == current.size()) {
+      pending.pop_back();
+      positions.pop_back();
+      continue;
+    }
+    const plist::Value& item = current[position++];
+    if (const std::string* identifier = item.string()) {
+      identifiers.push_back(*identifier);
+    } else if (const plist::Array* nested = item.array()) {
+      pending.push_back(nested);
+      positions.push_back(0);
+    }
+  }
+  return identifiers;
+}
 
 }  // namespace
 
@@ -75,8 +106,11 @@ PVPort FakePVHomeScreen::PVSPavilionBlockableServerPort() {
 int FakePVHomeScreen::PVSetIconState(PVPort port, const std::uint8_t* bytes, std::size_t length) {
   if (ErrorRef failure = beginCall(kSetIconState)) return static_cast<int>(statusFor(failure));
   if (port != port_) return kStatusInvalidPort;
+  plist::Bytes layout = length ? plist::Bytes(bytes, bytes + length) : plist::Bytes();
+  // The home screen arranges its icons as the layout says, so its icon order follows it.
+  if (std::optional<std::vector<std::string>> order = flattenLayout(layout)) setIconOrder(*order);
   std::lock_guard lock(mutex_);
-  lastIconState_ = length ? plist::Bytes(bytes, bytes + length) : plist::Bytes();
+  lastIconState_ = std::move(layout);
   return 0;
 }
 

@@ -19,6 +19,9 @@
 
 namespace appsync {
 
+// A layout given with PVSetIconState that is a property list whose root is an array (pages of
+// identifiers, folders as nested arrays) becomes the icon order PVGetFlattenedIconState reports:
+// its identifiers in order. Another layout is kept but changes no order.
 // Operations: "PVSPavilionBlockableServerPort", "PVSetIconState" (can fail: the error's code as
 // status, the layout not taken), "PVGetFlattenedIconState" (can fail: the error's code as
 // status, no buffer), "PVSApplicationTerminationAssertionCreateWithError" (outcomes are scripted
