@@ -1,4 +1,5 @@
-// Fuzzes outstandingAssetTransfers on a sync folder the host computer wrote: folder names
+// Fuzzes a sync on an upload the host computer wrote: reconcileSync takes the staging area over
+// as the sync folder and runs its removals, then outstandingAssetTransfers reads it. Folder names
 // (some of them links leading out of the device root) and the todo list's bytes come from the
 // input, on either installation road. Whatever the input, nothing outside the root changes.
 //
@@ -85,8 +86,8 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
 
   {
     FakePlatform device(root, {.coordination = (flags & 1) != 0});
-    const std::string syncFolder = device.paths().syncFolder();
-    if (!createDirectories(syncFolder)) fuzz::fail("cannot create the sync folder");
+    const std::string upload = device.paths().stagingArea();
+    if (!createDirectories(upload)) fuzz::fail("cannot create the staging area");
     int index = 0;
     for (std::size_t start = 0; start <= names.size();) {
       std::size_t end = names.find('\n', start);
@@ -94,7 +95,7 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
       const std::string_view name = names.substr(start, end - start);
       start = end + 1;
       if (!usableName(name)) continue;
-      const fs::path folder = fs::path(syncFolder) / std::string(name);
+      const fs::path folder = fs::path(upload) / std::string(name);
       std::error_code ec;
       if (index < 7 && (flags >> (index + 1) & 1)) {
         fs::create_directory_symlink(outside() / "Evil.app", folder, ec);
@@ -106,9 +107,12 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
       }
       ++index;
     }
-    writeFileAtomically(device.paths().todoList(), plist::Bytes(todo.begin(), todo.end()));
+    writeFileAtomically((fs::path(upload) / "ApplicationsSync.plist").string(),
+                        plist::Bytes(todo.begin(), todo.end()));
 
     AppsClient client(device.platform());
+    ErrorRef error;
+    client.reconcileSync(1, "fuzz", nullptr, &error);
     client.outstandingAssetTransfers();
     device.ar().drain();
     device.kc().drain();
