@@ -18,9 +18,7 @@
 namespace appsync::testing {
 
 // Keeps every coordinator lookup, placeholder and file promise the client obtains, so that a
-// test still sees them after the service has let them go (a cancelled coordinator is
-// forgotten). Coordinator events may call the service from its thread: the lists are read once
-// the service is drained.
+// test still sees them after the service has let them go. Read once the service is drained.
 class RecordingCoordination : public KCInstallCoordinationWrapper {
  public:
   struct Lookup {
@@ -35,9 +33,8 @@ class RecordingCoordination : public KCInstallCoordinationWrapper {
       bool* created, ErrorRef* error) override {
     std::lock_guard lock(mutex);
     lookups.push_back({kind, clientID, create});
-    return staleAnswer ? staleAnswer
-                       : KCInstallCoordinationWrapper::coordinatorForAppWithBundleID(
-                             kind, bundleID, clientID, create, created, error);
+    return KCInstallCoordinationWrapper::coordinatorForAppWithBundleID(kind, bundleID, clientID,
+                                                                       create, created, error);
   }
   std::shared_ptr<KCPlaceholder> initAppPlaceholder(const std::string& name, const std::string& id,
                                                     std::uint64_t installType,
@@ -56,23 +53,11 @@ class RecordingCoordination : public KCInstallCoordinationWrapper {
                                                                             diskSpaceNeeded));
     return made.back();
   }
-  void uninstallAppWithBundleID(const std::string& bundleID, bool requestUserConfirmation,
-                                std::function<void(ErrorRef)> completion) override {
-    {
-      std::lock_guard lock(mutex);
-      uninstallConfirmations.push_back(requestUserConfirmation);
-    }
-    KCInstallCoordinationWrapper::uninstallAppWithBundleID(bundleID, requestUserConfirmation,
-                                                           std::move(completion));
-  }
 
   std::mutex mutex;
-  // When set, every lookup answers this coordinator (one the service has already let go of).
-  std::shared_ptr<KCAppInstallCoordinator> staleAnswer;
   std::vector<Lookup> lookups;
   std::vector<std::shared_ptr<FakeKCPlaceholder>> placeholders;
   std::vector<std::shared_ptr<KCPromisedTransferToPath>> made;
-  std::vector<bool> uninstallConfirmations;
 };
 
 // An error a scripted service call reports.
@@ -101,33 +86,6 @@ inline std::string filePromise(const std::string& suffix, std::uint64_t diskSpac
          " cancelled=" + (reason == "(not cancelled)" ? "NO" : "YES") + " transferPath=" + path +
          "> " + reason;
 }
-// A placeholder as the fake describes it, whether it is configured, and why it was cancelled.
-inline std::string placeholderState(const std::shared_ptr<FakeKCPlaceholder>& placeholder) {
-  if (!placeholder) return "(none)";
-  return placeholder->describe() +
-         (placeholder->isConfigurationComplete() ? " configured " : " unconfigured ") +
-         reasonText(placeholder->cancelReason());
-}
-
-// Hears the cancellations of coordinators made under client 3 or 7, as
-// "ID REASON by client N". Safe from the service's thread.
-class CancellationWatcher : public KCAppInstallObserverDelegate {
- public:
-  void coordinator(const std::shared_ptr<KCAppInstallCoordinator>& c, const ErrorRef& reason,
-                   std::uint64_t client) override {
-    std::lock_guard lock(mutex_);
-    seen_.push_back(c->bundleID() + " " + reasonText(reason) + " by client " +
-                    std::to_string(client));
-  }
-  std::vector<std::string> seen() const {
-    std::lock_guard lock(mutex_);
-    return seen_;
-  }
-
- private:
-  mutable std::mutex mutex_;
-  std::vector<std::string> seen_;
-};
 
 inline FakePlatform::Options coordinatedRoad() {
   FakePlatform::Options options;
@@ -140,9 +98,6 @@ struct CoordinationDevice {
   FakePlatform device{root.path(), coordinatedRoad()};
   RecordingCoordination kc{device.kc()};
   AppsClient client{device.platform().with(kc)};
-  CancellationWatcher cancellations;
-  std::shared_ptr<KCAppInstallObserver> watching =
-      device.kc().initAppInstallObserver("test.cancellations", {3, 7}, &cancellations);
 
   CoordinationDevice() {
     device.log().clear();
@@ -151,12 +106,12 @@ struct CoordinationDevice {
   // Background work of the service may reach the client: it ends before the client does.
   ~CoordinationDevice() { device.kc().drain(); }
 
-  // The messages of one category without their "%s|" prefix; error-level ones marked.
-  std::vector<std::string> logged(int category = 8) {
+  // The messages of category 8 without their "%s|" prefix; error-level ones marked.
+  std::vector<std::string> logged() {
     const std::string prefix = pluginLine("");
     std::vector<std::string> out;
     for (const auto& line : device.log().lines()) {
-      if (line.category != category) continue;
+      if (line.category != 8) continue;
       std::string text = line.message.starts_with(prefix) ? line.message.substr(prefix.size())
                                                           : "(no prefix) " + line.message;
       out.push_back((line.level == LogLevel::Error ? "[error] " : "") + text);
@@ -171,10 +126,6 @@ struct CoordinationDevice {
   std::string placeholderDir(const std::string& id) {
     return client.placeholderAppPathForBundleIdentifier(id).value_or("(none)");
   }
-  std::shared_ptr<FakeKCAppInstallCoordinator> put(KCCoordinatorKind kind, const std::string& id,
-                                                   std::uint64_t creator = 3) {
-    return device.kc().putCoordinator(kind, id, creator);
-  }
 };
 
 // "step N party 1 phase P success S ID: TEXT", as the fake transaction log describes a step.
@@ -182,25 +133,6 @@ inline std::string step(int n, int phase, bool success, const std::string& id,
                         const std::string& text) {
   return "step " + std::to_string(n) + " party 1 phase " + std::to_string(phase) + " success " +
          (success ? "1 " : "0 ") + id + ": " + text;
-}
-
-// The message of a lookup for "com.example.app" that came back with the initiating (or, for an
-// existing app, updating) coordinator of `creator`, with no error.
-inline std::string coordinatorLine(bool existingApp, bool create, std::uint64_t creator = 3) {
-  const std::string kind = existingApp ? "updating" : "initiating";
-  const std::string flags = "createIfNotExisting:" + std::to_string(create) +
-                            ", existingApp:" + std::to_string(existingApp);
-  const std::string object =
-      std::string("<") + (existingApp ? "KCUpdating" : "KCInitiating") +
-      "AppInstallCoordinator bundleID=com.example.app creator=" + std::to_string(creator) + ">";
-  if (creator == kAppSyncCoordinationClient) {
-    return "Created " + kind + " coordinator " + object + " (" + flags +
-           ") for com.example.app with error (null)";
-  }
-  return "IC returned " + kind + " coordinator " + object + " (" + flags +
-         ", creatorIdentifier=" + std::to_string(creator) +
-         ") for com.example.app with error (null) - Will not perform install/update for this "
-         "bundle";
 }
 
 }  // namespace appsync::testing

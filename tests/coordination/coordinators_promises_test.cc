@@ -1,5 +1,6 @@
-// Coordinators, placeholders and promises as the client makes them: kinds and creators, names,
-// sizes, transfer paths and completion, configuration order, and what a failing step cancels.
+// Coordinators, placeholders and promises as the client makes them where no scenario reaches:
+// the coordinators it may not use, the cancellation of a refused promise, and the placeholder of
+// an app being restored, its configuration order and what a failing step cancels.
 #include <gtest/gtest.h>
 
 #include "coordination/coordination_fixture.h"
@@ -8,8 +9,6 @@ namespace appsync::coordinator_tests {
 namespace {
 
 using testing::CoordinationDevice;
-using testing::coordinatorLine;
-using testing::placeholderState;
 using testing::promiseState;
 using testing::reasonText;
 using testing::serviceError;
@@ -22,114 +21,70 @@ const plist::Bytes kIconBytes = {0x89, 'P', 'N', 'G', 1, 2, 3};
 const plist::Bytes kSinfBytes = {9, 8, 7};
 const std::string kErr = "[error] Error " + testing::serviceErrorText();
 
-TEST(CoordinatorLookupTest, OnlyItsOwnCoordinatorOfTheAskedKindIsUsed) {
-  enum Outcome { kCreated, kFound, kForeign, kNothing };
+// A placeholder as the fake describes it, whether it is configured, and why it was cancelled.
+std::string placeholderState(const std::shared_ptr<FakeKCPlaceholder>& placeholder) {
+  return placeholder->describe() +
+         (placeholder->isConfigurationComplete() ? " configured " : " unconfigured ") +
+         reasonText(placeholder->cancelReason());
+}
+
+// The client's own coordinator of the asked kind is shown by the scenarios; these are the ones
+// it may not use.
+TEST(CoordinatorLookupTest, AnotherClientsOrAnotherKindOfCoordinatorIsNotUsed) {
   struct Case {
     const char* name;
-    std::optional<Kind> existing;
+    Kind existing;
     std::uint64_t creator;  // of the existing coordinator
     bool existingApp, create;
-    Outcome outcome;
-    std::int64_t errorCode = 0;  // of the error out-parameter; 0: none
-    bool scriptFailure = false;
+    std::int64_t errorCode;  // of the error out-parameter; -1: none passed
   };
   const Case cases[] = {
-      {"new updating", {}, 3, true, true, kCreated},
-      {"existing, not creating", Kind::Initiating, 3, false, false, kFound},
-      {"existing updating, creating", Kind::Updating, 3, true, true, kFound},
-      {"another client's", Kind::Initiating, 7, false, true, kForeign},
-      {"another client's updating", Kind::Updating, 1, true, false, kForeign},
-      {"one of another kind", Kind::Updating, 3, false, true, kNothing,
-       kKCErrorCoordinatorKindMismatch},
-      {"none, not creating", {}, 3, false, false, kNothing},
-      {"service fails", {}, 3, true, true, kNothing, 77, true},
+      {"another client's", Kind::Initiating, 7, false, true, 0},
+      {"another client's updating, no error wanted", Kind::Updating, 1, true, false, -1},
+      {"one of another kind", Kind::Updating, 3, false, true, kKCErrorCoordinatorKindMismatch},
   };
   for (const Case& c : cases) {
     SCOPED_TRACE(c.name);
     CoordinationDevice d;
-    auto existing = c.existing ? d.put(*c.existing, kApp, c.creator) : nullptr;
-    if (c.scriptFailure) {
-      d.device.kc().failOperation(
-          "coordinatorForAppWithBundleID:withClientID:createIfNotExisting:created:error:",
-          serviceError());
-    }
+    auto existing = d.device.kc().putCoordinator(c.existing, kApp, c.creator);
     ErrorRef error = makeError("Untouched", 1);
-    // The out-parameter is optional: a foreign coordinator is also refused without one.
-    ErrorRef* out = c.outcome == kForeign && c.existingApp ? nullptr : &error;
 
-    auto result = d.client._initiatingOrUpdatingAppInstallCoordinatorForBundleIdentifier(
-        kApp, c.existingApp, c.create, out);
+    EXPECT_FALSE(d.client._initiatingOrUpdatingAppInstallCoordinatorForBundleIdentifier(
+        kApp, c.existingApp, c.create, c.errorCode < 0 ? nullptr : &error));
 
-    const bool returned = c.outcome == kCreated || c.outcome == kFound;
-    const Kind asked = c.existingApp ? Kind::Updating : Kind::Initiating;
-    ASSERT_EQ(result != nullptr, returned);
-    if (returned) {
-      EXPECT_EQ(result->kind(), asked);
-      EXPECT_EQ(result->creatorIdentifier(), 3u);
-      EXPECT_EQ(result, d.device.kc().coordinator(kApp));
-      if (existing) {
-        EXPECT_EQ(result, existing);
-      }
-    } else if (existing) {  // left as it was, still the service's
-      EXPECT_EQ(existing->state(), FakeKCAppInstallCoordinator::State::Active);
-      EXPECT_EQ(d.device.kc().coordinator(kApp), existing);
-    } else {
-      EXPECT_FALSE(d.device.kc().coordinator(kApp));
-    }
+    EXPECT_EQ(existing->state(), FakeKCAppInstallCoordinator::State::Active);
+    EXPECT_EQ(d.device.kc().coordinator(kApp), existing);
     ASSERT_EQ(d.kc.lookups.size(), 1u);
-    EXPECT_EQ(d.kc.lookups[0].kind, asked);
+    EXPECT_EQ(d.kc.lookups[0].kind, c.existingApp ? Kind::Updating : Kind::Initiating);
     EXPECT_EQ(d.kc.lookups[0].client, 3u);
     EXPECT_EQ(d.kc.lookups[0].create, c.create);
-    if (out) {
+    if (c.errorCode >= 0) {
       EXPECT_EQ(error ? error->code : 0, c.errorCode) << reasonText(error);
     }
-    const bool logged = c.outcome != kNothing;
-    EXPECT_EQ(d.logged(),
-              logged ? Messages{coordinatorLine(c.existingApp, c.create, c.creator)} : Messages{});
+    const std::string kind = c.existingApp ? "updating" : "initiating";
+    const std::string foreign =
+        "IC returned " + kind + " coordinator <" + (c.existingApp ? "KCUpdating" : "KCInitiating") +
+        "AppInstallCoordinator bundleID=com.example.app creator=" + std::to_string(c.creator) +
+        "> (createIfNotExisting:" + std::to_string(c.create) +
+        ", existingApp:" + std::to_string(c.existingApp) +
+        ", creatorIdentifier=" + std::to_string(c.creator) +
+        ") for com.example.app with error (null) - Will not perform install/update for this bundle";
+    EXPECT_EQ(d.logged(), c.creator == 3 ? Messages{} : Messages{foreign});
     EXPECT_EQ(d.steps(), (Messages{step(3, 1, true, kApp, "Create coordinator"),
-                                   step(3, 2, returned, kApp, "Finished creating coordinator")}));
+                                   step(3, 2, false, kApp, "Finished creating coordinator")}));
   }
 }
 
-TEST(CoordinatorPlaceholderTest, PlaceholderAndUserDataPromiseAreMadeUnderClient3) {
-  for (bool refused : {false, true}) {
-    SCOPED_TRACE(refused);
-    CoordinationDevice d;
-    if (refused) {
-      d.device.kc().failOperation("initAppPlaceholderWithBundleName:bundleID:installType:client:");
-      d.device.kc().failOperation(
-          "KCPromisedOutOfBandTransfer initWithName:client:diskSpaceNeeded:");
-    }
-    auto placeholder = d.client._placeHolderForBundleIdentifier(kApp, "Name", 8);
-    auto userData = d.client._userDataPromiseForBundleIdentifier(kApp);
-
-    const std::string made =
-        "<KCPlaceholder bundleID=com.example.app name=\"Name\" installType=8 client=3>";
-    EXPECT_EQ(placeholderState(std::dynamic_pointer_cast<FakeKCPlaceholder>(placeholder)),
-              refused ? "(none)" : made + " unconfigured (not cancelled)");
-    EXPECT_EQ(promiseState(userData),
-              refused ? "(none)"
-                      : "<KCPromisedOutOfBandTransfer name=com.example.app-UserData client=3 "
-                        "diskSpaceNeeded=0 percentComplete=1 complete=YES cancelled=NO> "
-                        "(not cancelled)");
-    EXPECT_EQ(d.logged(), Messages{"Created placeholder " + (refused ? "(null)" : made) +
-                                   " for 'com.example.app' of type 8"});
-    EXPECT_EQ(d.steps(), (Messages{step(4, 1, true, kApp, "Create placeholder"),
-                                   step(4, 2, !refused, kApp, "Finished creating placeholder")}));
-  }
-}
-
-// Promises that are made and attached are shown by the preparation; here are the ways they are
-// not, and the reason a refused one is cancelled with (30 on the app-install road, 29 on restore).
-TEST(CoordinatorPromiseTest, APromiseNotAttachedIsCancelledForItsRoad) {
+// A promise that its placeholder or coordinator refuses is cancelled for its road: 30 on the
+// app-install road, 29 on restore.
+TEST(CoordinatorPromiseTest, ARefusedPromiseIsCancelledForItsRoad) {
   const std::string path = "/packages/Sample.app";
   auto icon = [](const std::string& reason) {
     return testing::filePromise("Icon", 4096, "1", true, "file:///icons/Icon.png", reason);
   };
   const std::string iconRefused = kErr + " adding icon promise to placeholder for '" + kApp + "'";
   struct Case {
-    const char* name;
-    bool asset, holder;  // an asset promise (else an icon promise); its coordinator or placeholder
+    bool asset;  // an asset promise, else an icon promise
     const char* failing;
     bool forAppInstall;
     Messages messages;
@@ -137,31 +92,22 @@ TEST(CoordinatorPromiseTest, APromiseNotAttachedIsCancelledForItsRoad) {
   };
   // clang-format off
   const Case cases[] = {
-      {"icon, no placeholder", false, false, nullptr, true,
-       {"[error] Placeholder to add icon promise is nil for '" + kApp + "'"}, "(none)"},
-      {"icon not made", false, true, "KCPromisedTransferToPath initWithName:client:transferPath:diskSpaceNeeded:",
-       true, {}, "(none)"},
-      {"icon refused, app install", false, true, "setIconPromise:error:", true, {iconRefused},
-       icon("Error Domain=TRError Code=30")},
-      {"icon refused, restore", false, true, "setIconPromise:error:", false, {iconRefused},
-       icon("Error Domain=TRError Code=29")},
-      {"asset, no coordinator", true, false, nullptr, true, {}, "(none)"},
-      {"asset not made", true, true, "KCPromisedTransferToPath initWithName:client:transferPath:diskSpaceNeeded:",
-       true, {"[error] Error creating asset promise for '" + kApp + "'"}, "(none)"},
-      {"asset refused", true, true, "setAppAssetPromise:error:", true,
+      {false, "setIconPromise:error:", true, {iconRefused}, icon("Error Domain=TRError Code=30")},
+      {false, "setIconPromise:error:", false, {iconRefused}, icon("Error Domain=TRError Code=29")},
+      {true, "setAppAssetPromise:error:", true,
        {kErr + " adding app asset promise at " + path + " to '" + kApp + "'",
         "[error] Cancelling asset promise for '" + kApp + "'"},
        testing::filePromise("Asset", 0, "0", false, "file://" + path, "Error Domain=TRError Code=30")},
   };
   // clang-format on
   for (const Case& c : cases) {
-    SCOPED_TRACE(c.name);
+    SCOPED_TRACE(c.promise);
     CoordinationDevice d;
-    auto coordinator = c.asset && c.holder ? d.put(Kind::Initiating, kApp) : nullptr;
-    auto placeholder = !c.asset && c.holder ? std::dynamic_pointer_cast<FakeKCPlaceholder>(
-                                                  d.device.kc().initAppPlaceholder("N", kApp, 4, 3))
-                                            : nullptr;
-    if (c.failing) d.device.kc().failOperation(c.failing, serviceError());
+    auto coordinator = c.asset ? d.device.kc().putCoordinator(Kind::Initiating, kApp, 3) : nullptr;
+    auto placeholder = c.asset ? nullptr
+                               : std::dynamic_pointer_cast<FakeKCPlaceholder>(
+                                     d.device.kc().initAppPlaceholder("N", kApp, 4, 3));
+    d.device.kc().failOperation(c.failing, serviceError());
 
     auto promise = c.asset
                        ? d.client._createAppAssetPromiseForBundleIdentifier(kApp, path, coordinator)
@@ -170,8 +116,8 @@ TEST(CoordinatorPromiseTest, APromiseNotAttachedIsCancelledForItsRoad) {
 
     EXPECT_FALSE(promise);
     EXPECT_EQ(d.logged(), c.messages);
-    EXPECT_EQ(d.kc.made.size(), c.holder ? 1u : 0u);
-    EXPECT_EQ(promiseState(d.kc.made.empty() ? nullptr : d.kc.made[0]), c.promise);
+    ASSERT_EQ(d.kc.made.size(), 1u);
+    EXPECT_EQ(promiseState(d.kc.made[0]), c.promise);
     if (coordinator) {
       EXPECT_FALSE(coordinator->snapshot().appAssetPromise);
     }
