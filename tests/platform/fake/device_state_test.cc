@@ -8,9 +8,9 @@
 #include <filesystem>
 #include <map>
 
-#include "runtime/fs/files.h"
 #include "platform/fake/fake_platform.h"
 #include "platform/fake/state_fields.h"
+#include "runtime/fs/files.h"
 #include "support/temp_dir.h"
 #include "support/text_file.h"
 

@@ -1,6 +1,6 @@
-// Package installs into the fake registry: a zip archive installs like its bundle folder, a
-// hostile or broken archive is refused as a bad package with nothing written, and the SINF
-// bytes of the options decide the record's hasMIDBasedSINF.
+// Package installs into the fake registry: a hostile or broken archive is refused as a bad
+// package with nothing written, and the SINF bytes of the options decide the record's
+// hasMIDBasedSINF. Good archives and bundle folders install in the coordinated-install scenario.
 #include <gtest/gtest.h>
 
 #include <filesystem>
@@ -56,52 +56,6 @@ class FakeARPackageTest : public ::testing::Test {
   testing::TempDir packages;  // where packages are delivered from
   FakeARWorkspace registry{root.path()};
 };
-
-TEST_F(FakeARPackageTest, AZipInstallsTheBundleFolderItHolds) {
-  const std::string info = infoPlist("com.game", "3.1");
-  const std::string level(5000, 'x');
-  struct Case {
-    const char* name;
-    std::string archive;
-    std::vector<ZipEntry> entries;
-    std::string bundle;
-  };
-  // An archive with folder entries, as the host packs one, is installed in the
-  // coordinated-install scenario.
-  const Case cases[] = {
-      {"folders implied by the files",
-       "Game.zip",
-       {{"Game.app/Info.plist", info}, {"Game.app/Data/level", level}},
-       "Game.app"},
-      {"the archive named apart from its bundle",
-       "Download.zip",
-       {{"Arcade.app/Info.plist", info}, {"Arcade.app/Data/level", level}},
-       "Arcade.app"},
-  };
-  for (const Case& c : cases) {
-    SCOPED_TRACE(c.name);
-    const std::string archive = packages / c.archive;
-    testing::writeZip(archive, c.entries);
-    ErrorRef error;
-    ASSERT_TRUE(registry.installApplication(archive, packageOptions("com.game"), &error))
-        << (error ? error->describe() : "");
-
-    const std::string container = *registry.containerDirectoryFor("com.game");
-    auto record = registry.application("com.game");
-    ASSERT_TRUE(record);
-    EXPECT_EQ(record->bundleDirectory, container + "/" + c.bundle);
-    EXPECT_EQ(record->version, "3.1");
-    EXPECT_EQ(record->staticDiskUsage, info.size() + level.size());
-    EXPECT_FALSE(record->isPlaceholder);
-    // The container holds the bundle only: no scratch folder is left.
-    const std::map<std::string, std::string> expected = {{c.bundle, ""},
-                                                         {c.bundle + "/Info.plist", info},
-                                                         {c.bundle + "/Data", ""},
-                                                         {c.bundle + "/Data/level", level}};
-    EXPECT_EQ(tree(container), expected);
-    EXPECT_TRUE(fileExists(archive)) << "the delivered package is the caller's";
-  }
-}
 
 TEST_F(FakeARPackageTest, ABadPackageIsRefusedAndWritesNothing) {
   const std::string info = infoPlist("com.game", "2.0");

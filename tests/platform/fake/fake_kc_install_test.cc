@@ -31,12 +31,10 @@ std::shared_ptr<const EMStoreMetadata> metadata(const std::optional<plist::Dict>
 
 class FakeKCInstallTest : public ::testing::Test {
  protected:
-  // A coordinator of `id` whose placeholder carries `placeholderMetadata` and `sinf`, whose
-  // install options carry `optionsMetadata` (no options without), and whose asset promise,
-  // not yet complete, names `package`.
+  // A coordinator of `id` whose placeholder carries `placeholderMetadata` and `sinf`, without
+  // install options, and whose asset promise, not yet complete, names `package`.
   Coordinator coordinator(const std::string& id, const std::string& package,
                           const std::optional<plist::Dict>& placeholderMetadata = std::nullopt,
-                          const std::optional<plist::Dict>& optionsMetadata = std::nullopt,
                           const std::optional<plist::Bytes>& sinf = std::nullopt) {
     Coordinator c = kc.coordinatorForAppWithBundleID(KCCoordinatorKind::Initiating, id, kOurClient,
                                                      true, nullptr, nullptr);
@@ -48,11 +46,6 @@ class FakeKCInstallTest : public ::testing::Test {
     if (sinf) placeholder->setSinfData(*sinf, nullptr);
     placeholder->setConfigurationCompleteWithError(nullptr);
     c->setPlaceholderPromise(placeholder, nullptr);
-    if (optionsMetadata) {
-      auto options = std::make_shared<EMInstallOptions>();
-      options->setCaravelMetadata(metadata(optionsMetadata));
-      c->setInstallOptions(options, nullptr);
-    }
     c->setAppAssetPromise(kc.initPromisedTransferToPath("asset", kOurClient, package, 0), nullptr);
     return c;
   }
@@ -67,28 +60,26 @@ class FakeKCInstallTest : public ::testing::Test {
 
 TEST_F(FakeKCInstallTest, TheInstallCarriesMetadataAndSINFIntoTheRegistry) {
   const plist::Dict placeholderMetadata{{"itemName", "From the placeholder"}};
-  const plist::Dict optionsMetadata{{"itemName", "From the options"}, {"itemId", 42}};
   struct Case {
     const char* name;
-    std::optional<plist::Dict> placeholderMetadata, optionsMetadata;
+    std::optional<plist::Dict> placeholderMetadata;
     std::optional<plist::Bytes> sinf;
     std::optional<plist::Dict> expectedMetadata;
     bool marked;
   };
+  // The options' metadata, written beside the app, is shown by the coordinated-install scenario.
   const Case cases[] = {
-      {"the options' metadata wins", placeholderMetadata, optionsMetadata, plist::Bytes{1, 2},
-       optionsMetadata, true},
-      {"the placeholder's metadata otherwise", placeholderMetadata, std::nullopt, std::nullopt,
-       placeholderMetadata, false},
-      {"no metadata at all", std::nullopt, std::nullopt, plist::Bytes{}, std::nullopt, false},
+      {"the placeholder's metadata and SINF", placeholderMetadata, plist::Bytes{1, 2},
+       placeholderMetadata, true},
+      {"no metadata at all, empty SINF", std::nullopt, plist::Bytes{}, std::nullopt, false},
   };
   const std::string info = packageInfo("com.game", "3.1");
   const std::string data(1234, 'd');
   testing::writeZip(packages / "Game.zip", {{"Game.app/Info.plist", info}, {"Game.app/d", data}});
   for (const Case& c : cases) {
     SCOPED_TRACE(c.name);
-    Coordinator game = coordinator("com.game", "file://" + (packages / "Game.zip"),
-                                   c.placeholderMetadata, c.optionsMetadata, c.sinf);
+    Coordinator game =
+        coordinator("com.game", "file://" + (packages / "Game.zip"), c.placeholderMetadata, c.sinf);
     kc.drain();
     auto placeholder = registry.application("com.game");
     ASSERT_TRUE(placeholder && placeholder->isPlaceholder);
@@ -136,19 +127,12 @@ TEST_F(FakeKCInstallTest, AFinishedCoordinatorsOutcomeIsKept) {
     std::function<void()> finish;
     FinishedCoordinator expected;
   };
+  // An installed one and one a client cancelled are shown by the coordinated-install scenario.
   const Case cases[] = {
-      {"installed",
-       [&] { deliver(coordinator("com.game", good)); },
-       {"com.game", KCCoordinatorKind::Initiating, State::Completed}},
       {"the install failed",
        [&] { deliver(coordinator("com.game", missing)); },
        {"com.game", KCCoordinatorKind::Initiating, State::Completed, domain,
         kKCErrorInstallFailed}},
-      {"cancelled by a client with a reason",
-       [&] {
-         coordinator("com.game", good)->cancelForReason(makeError("Test", 5, "no"), 9, nullptr);
-       },
-       {"com.game", KCCoordinatorKind::Initiating, State::Cancelled, "Test", 5, 9}},
       {"cancelled without a reason",
        [&] { coordinator("com.game", good)->cancelForReason(nullptr, kOurClient, nullptr); },
        {"com.game", KCCoordinatorKind::Initiating, State::Cancelled, domain, kKCErrorCanceled,
