@@ -10,12 +10,8 @@
 #include "device_session.h"
 #include "input_error.h"
 #include "platform/fake/fake_kc_objects.h"
-#include "platform/icon/png_codec.h"
 #include "platform/tr_client.h"
 #include "replay/step_context.h"
-#include "runtime/fs/files.h"
-#include "runtime/plist/codec.h"
-#include "state/loaders.h"
 #include "support/temp_dir.h"
 #include "yaml_input.h"
 
@@ -143,29 +139,6 @@ TEST_F(ReplayActionsTest, HostOperationsTheClientLacksAnswerNotImplemented) {
   EXPECT_EQ(run("{call: supportedDataclasses}"), plist::Value(plist::Array{"Application"}));
 }
 
-TEST_F(ReplayActionsTest, StagedTodoListIsBinaryAndTheLoaderReadsIt) {
-  run("{stage: todo, list: [{identifier: com.a, operation: install, version: '1.0', name: A}]}");
-  const std::string path = session_->paths().todoList();
-  plist::Format format;
-  ASSERT_TRUE(plist::parse(readFile(path).value_or(plist::Bytes{}), nullptr, &format));
-  EXPECT_EQ(format, plist::Format::Binary);
-  const auto list = loadTodoList(session_->device().tr(), path, nullptr);
-  const plist::Array expected{plist::Dict{
-      {"identifier", "com.a"}, {"operation", "install"}, {"version", "1.0"}, {"name", "A"}}};
-  EXPECT_EQ(list, expected);
-}
-
-// Staged bundle folders and zips install in the coordinated-install scenario; a zip may be named
-// and placed apart from its bundle, and its packing leaves no scratch behind.
-TEST_F(ReplayActionsTest, StagedPackagesAreBundleFoldersOrZipsHoldingThem) {
-  EXPECT_EQ(run("{stage: package, identifier: com.b, name: Maps, as: zip, file: in/Other.zip}"),
-            plist::Value("var/mobile/Media/PublicStaging/in/Other.zip"));
-  EXPECT_TRUE(fileExists((root() / "var/mobile/Media/PublicStaging/in/Other.zip").string()));
-  for (const auto& entry : fs::directory_iterator(root() / "tmp")) {
-    ADD_FAILURE() << "scratch left behind: " << entry.path();
-  }
-}
-
 TEST_F(ReplayActionsTest, PathsThatLeaveTheRootOrCrossALinkAreRefused) {
   const fs::path outside = dir_.path() / "outside";
   fs::create_directories(outside);
@@ -195,16 +168,8 @@ TEST_F(ReplayActionsTest, PathsThatLeaveTheRootOrCrossALinkAreRefused) {
 }
 
 TEST_F(ReplayActionsTest, PlatformChangesReachTheFakes) {
+  // A scripted failure is shown by the platform-failures scenario.
   FakePlatform& device = session_->device();
-  run("{platform: fail, service: registry, operation: 'installApplication:withOptions:error:', "
-      "times: 1, error: {domain: AppRegistryError, code: 5, description: no space}}");
-  ErrorRef error;
-  EXPECT_FALSE(device.ar().installApplication("/nowhere", {}, &error));
-  ASSERT_TRUE(error);
-  EXPECT_EQ(error->domain, "AppRegistryError");
-  EXPECT_EQ(error->code, 5);
-  EXPECT_NE(error->describe().find("no space"), std::string::npos);
-
   run("{platform: install-app, identifier: com.a, name: Notes, version: '2.0'}");
   auto record = device.ar().application("com.a");
   ASSERT_TRUE(record);
