@@ -28,8 +28,9 @@ namespace {
 namespace fs = std::filesystem;
 using AppRecord = FakeARWorkspace::AppRecord;
 
-// Store metadata, restrictions, the icon order, the last sync and the uninstalled list are read
-// by the plugin in the scenarios (reporting, sync-legacy and others); the rest is shown here.
+// System apps, store metadata, restrictions, the icon order, the last sync and the uninstalled
+// list are read by the plugin in the scenarios (reporting, sync-legacy and others); the rest is
+// shown here.
 constexpr std::string_view kDescription = R"(road: coordination
 insideHostDaemon: true
 apps:
@@ -39,16 +40,9 @@ apps:
     installType: storeDownload
     hasMIDBasedSINF: true
     restoreData: 4096
-  - identifier: com.a.clock
-    name: Clock
-    type: system
-    diskUsage: 777
   - identifier: com.a.later
     placeholder: true
     installType: 2
-  - identifier: com.a.settings
-    type: system
-    placeholder: true
 demotedApps: {AutomaticDowngrades: [com.a.later]}
 )";
 
@@ -102,13 +96,8 @@ TEST(DeviceDescriptionTest, EverythingDescribedIsWhereThePluginReadsIt) {
   const std::string at = "private/var/containers/Bundle/Application/";
   const std::vector<std::string> expected = {
       show(installedNotes),
-      "com.a.clock System 1.0 Clock type 0 " + at + "com.a.clock/Clock.app in " + at +
-          "com.a.clock icon " + at + "com.a.clock/Clock.app/Icon.png disk 777",
       "com.a.later User 1.0 later type 2 placeholder " + at + "com.a.later/later.app in - icon " +
           at + "com.a.later/later.app/Icon.png disk -",
-      "com.a.settings System 1.0 settings type 0 placeholder " + at +
-          "com.a.settings/settings.app in - icon " + at +
-          "com.a.settings/settings.app/Icon.png disk -",
   };
   std::vector<std::string> records;
   for (const AppRecord& app : device.ar().applications())
@@ -229,15 +218,6 @@ TEST(DeviceInitCommandTest, MakesSavesAndRefusesDevices) {
   ASSERT_EQ(init("plain", "").status, 0);
   EXPECT_EQ(recordsOf(*DeviceSession::open(dir / "plain")),
             recordsOf(*DeviceSession::open(dir / "default.yaml")));
-
-  // A described app's icon renders from its bundle on the device.
-  const testing::HostRun icon = testing::runHost(
-      host,
-      "icon '" +
-          (dir / "plain/private/var/containers/Bundle/Application/com.example.notes/Notes.app") +
-          "' -o '" + (dir / "notes.png") + "'",
-      dir.path());
-  EXPECT_EQ(icon.status, 0) << icon.stderrText;
 
   // A root that holds a device is refused and left alone; bad input makes no device.
   const testing::HostRun again = init("plain", "");
