@@ -87,15 +87,9 @@ inline std::string filePromise(const std::string& suffix, std::uint64_t diskSpac
          "> " + reason;
 }
 
-inline FakePlatform::Options coordinatedRoad() {
-  FakePlatform::Options options;
-  options.coordination = true;
-  return options;
-}
-
 struct CoordinationDevice {
   TempDir root;
-  FakePlatform device{root.path(), coordinatedRoad()};
+  FakePlatform device{root.path(), {.coordination = true}};
   RecordingCoordination kc{device.kc()};
   AppsClient client{device.platform().with(kc)};
 
