@@ -19,9 +19,12 @@ bool makeDirectoryChain(const std::string& path, std::vector<std::string>& made,
     setError(error, makePOSIXError(ENOENT, path));
     return false;
   }
-  for (std::string::size_type end = path.find('/', 1);; end = path.find('/', end + 1)) {
+  // Only the components past the deepest existing directory are new.
+  const std::size_t existing = existingDirectoryPrefix(path);
+  if (existing == path.size()) return true;
+  for (std::string::size_type end = path.find('/', existing + 1);; end = path.find('/', end + 1)) {
     const std::string prefix = path.substr(0, end);
-    if (!prefix.empty() && prefix.back() != '/' && !directoryExists(prefix)) {
+    if (!prefix.empty() && prefix.back() != '/') {
       ErrorRef mkdirError;
       if (createDirectory(prefix, &mkdirError)) {
         made.push_back(prefix);

@@ -39,6 +39,8 @@ TEST(PlaceholderDirectoryTest, SucceedsAgainAndOnlyOwnsWhatItMade) {
                                               dir + " with err=(null)")),
               2u);
     EXPECT_FALSE(d.device.system().ownership(d.tempDir()));
+    EXPECT_TRUE(d.device.system().ownership(d.appsDir()));
+    EXPECT_TRUE(d.device.system().ownership(dir));
     EXPECT_TRUE(d.scenarios().empty());
   }
 }

@@ -46,14 +46,22 @@ bool isSafeName(const std::string& name) {
          name.find_first_of(std::string_view("/\0", 2)) == std::string::npos;
 }
 
-// True when `path` is a regular file that, with symbolic links resolved, lies inside
-// `bundleDir`: a link in a bundle must not make the renderer read files elsewhere.
-bool isBundleFile(const std::filesystem::path& bundleDir, const std::filesystem::path& path) {
+// True when the entry `name` of `bundleDir` is a regular file that, with symbolic links
+// resolved, lies inside the bundle: a link in a bundle must not make the renderer read files
+// elsewhere. `name` is one path component (no "/", not "." or ".."), so an entry that is not a
+// link lies inside the bundle as it stands; only a link has its target resolved and compared.
+bool isBundleFile(const std::string& bundleDir, const std::string& name) {
+  namespace fs = std::filesystem;
+  if (bundleDir.empty()) return false;  // no bundle, and not the working directory either
+  const fs::path path = fs::path(bundleDir) / name;
   std::error_code ec;
-  if (!std::filesystem::is_regular_file(path, ec)) return false;
-  const std::filesystem::path base = std::filesystem::canonical(bundleDir, ec);
+  const fs::file_status entry = fs::symlink_status(path, ec);
   if (ec) return false;
-  const std::filesystem::path target = std::filesystem::canonical(path, ec);
+  if (fs::is_regular_file(entry)) return true;
+  if (!fs::is_symlink(entry) || !fs::is_regular_file(path, ec)) return false;
+  const fs::path base = fs::canonical(bundleDir, ec);
+  if (ec) return false;
+  const fs::path target = fs::canonical(path, ec);
   if (ec) return false;
   return std::mismatch(base.begin(), base.end(), target.begin(), target.end()).first == base.end();
 }
@@ -176,8 +184,10 @@ std::vector<std::string> iconFileCandidates(const std::string& bundleDir, const 
   std::string base = name;
   if (base.size() > 4 && base.ends_with(".png")) base.resize(base.size() - 4);
   for (const char* suffix : kVariantSuffixes) {
-    const std::filesystem::path path = std::filesystem::path(bundleDir) / (base + suffix + ".png");
-    if (isBundleFile(bundleDir, path)) files.push_back(path.string());
+    const std::string file = base + suffix + ".png";
+    if (isBundleFile(bundleDir, file)) {
+      files.push_back((std::filesystem::path(bundleDir) / file).string());
+    }
   }
   return files;
 }
@@ -190,7 +200,7 @@ std::optional<BundleIcon> findBundleIcon(const std::string& bundleDir, int targe
     return std::nullopt;
   };
   const std::string infoPath = (std::filesystem::path(bundleDir) / "Info.plist").string();
-  if (!isBundleFile(bundleDir, infoPath)) return failWith("no Info.plist in " + bundleDir);
+  if (!isBundleFile(bundleDir, "Info.plist")) return failWith("no Info.plist in " + bundleDir);
   std::vector<std::uint8_t> infoBytes;
   if (!readWholeFile(infoPath, plist::kMaxInputSize, &infoBytes, &problem)) {
     return failWith(problem);

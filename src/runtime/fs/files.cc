@@ -269,10 +269,21 @@ bool directoryExists(const std::string& path) {
   return ::stat(path.c_str(), &st) == 0 && S_ISDIR(st.st_mode);
 }
 
+std::size_t existingDirectoryPrefix(const std::string& path) {
+  std::size_t end = path.size();
+  while (end > 0 && !directoryExists(path.substr(0, end))) {
+    const std::string::size_type slash = path.rfind('/', end - 1);
+    end = slash == std::string::npos ? 0 : slash;
+  }
+  return end;
+}
+
 bool createDirectories(const std::string& path, ErrorRef* error) {
   if (path.empty()) return fail(error, ENOENT, path);
-  // Each prefix that ends a component, then the whole path.
-  for (std::string::size_type end = path.find('/', 1);; end = path.find('/', end + 1)) {
+  const std::size_t existing = existingDirectoryPrefix(path);
+  if (existing == path.size()) return true;
+  // Each prefix that ends a component past the existing one, then the whole path.
+  for (std::string::size_type end = path.find('/', existing + 1);; end = path.find('/', end + 1)) {
     std::string prefix = path.substr(0, end);
     if (!prefix.empty() && prefix.back() != '/' && ::mkdir(prefix.c_str(), 0755) != 0) {
       int err = errno;

@@ -77,6 +77,10 @@ std::optional<plist::Dict> readPlistDictionary(const std::string& path);
 bool fileExists(const std::string& path);
 bool directoryExists(const std::string& path);
 
+// The length of the longest prefix of `path` that ends at a component boundary and names an
+// existing directory: path.size() when the whole path is one, 0 when no prefix is. Found from
+// the deepest end upwards, so that making a path whose parents exist costs few system calls.
+std::size_t existingDirectoryPrefix(const std::string& path);
 // mkdir -p. True when the directory exists afterwards.
 bool createDirectories(const std::string& path, ErrorRef* error = nullptr);
 // mkdir of the last component only (parents must exist). True when it was created.

@@ -120,5 +120,42 @@ TEST(WriteFileAtomicallyTest, FailuresLeaveTheOldFileIntact) {
   }
 }
 
+// mkdir -p starts below the deepest directory that exists and names the whole path on failure.
+TEST(CreateDirectoriesTest, MakesWhatIsMissingBelowTheDeepestExistingDirectory) {
+  struct Case {
+    const char* name;
+    std::string relative;  // the path to make, below the temporary directory
+    std::string existing;  // the prefix of it expected to exist beforehand ("" for the root)
+    int expectedErrno;     // 0 for success
+  };
+  const std::vector<Case> cases = {
+      {"all there", "a/b", "a/b", 0},
+      {"last missing", "a/b/c", "a/b", 0},
+      {"several missing, doubled and trailing slashes", "x//y/z/", "", 0},
+      {"through a link to a directory", "link/new", "link", 0},
+      {"a file on the way", "file/sub", "", ENOTDIR},
+      {"a file at the end", "file", "", ENOTDIR},
+  };
+  for (const Case& c : cases) {
+    SCOPED_TRACE(c.name);
+    testing::TempDir dir;
+    ASSERT_TRUE(createDirectory(dir / "a") && createDirectory(dir / "a/b"));
+    fs::create_directory_symlink("a", dir.path() / "link");
+    ASSERT_TRUE(writeFileAtomically(dir / "file", bytesOf("x")));
+    const std::string root = dir.path().string();
+    const std::string path = root + "/" + c.relative;
+    const std::string existing = c.existing.empty() ? root : root + "/" + c.existing;
+    EXPECT_EQ(path.substr(0, existingDirectoryPrefix(path)), existing);
+    ErrorRef error;
+    EXPECT_EQ(createDirectories(path, &error), c.expectedErrno == 0);
+    if (c.expectedErrno == 0) {
+      EXPECT_FALSE(error);
+      EXPECT_TRUE(directoryExists(path));
+    } else {
+      expectPOSIXError(error, c.expectedErrno, path);
+    }
+  }
+}
+
 }  // namespace
 }  // namespace appsync
