@@ -2,12 +2,12 @@
 // removals are performed, and the home screen learns that a sync starts.
 #include <sys/stat.h>
 
-#include <algorithm>
 #include <cerrno>
 #include <filesystem>
 #include <system_error>
 
 #include "client/apps_client.h"
+#include "client/asset_path.h"
 #include "runtime/fs/files.h"
 
 namespace appsync {
@@ -27,13 +27,9 @@ bool isLink(const std::string& path) {
 // root: a directory reached through a link out of the root is not ours to remove, create, move
 // from or move into.
 bool resolvesInsideRoot(const std::string& path, const std::filesystem::path& root) {
-  std::error_code error;
-  const std::filesystem::path resolvedRoot = std::filesystem::canonical(root, error);
-  if (error) return false;
-  const std::filesystem::path resolved = std::filesystem::weakly_canonical(path, error);
-  if (error) return false;
-  return std::mismatch(resolvedRoot.begin(), resolvedRoot.end(), resolved.begin(), resolved.end())
-             .first == resolvedRoot.end();
+  const std::filesystem::path name = std::filesystem::path(path).lexically_relative(root);
+  if (name.empty() || *name.begin() == "..") return false;
+  return resolvesInside(root.string(), name.string());
 }
 
 }  // namespace
