@@ -63,7 +63,6 @@ TEST_F(ReplayActionsTest, BadArgumentsAreInputErrorsNamingTheField) {
       {"{call: 'assetInstallFailed:withError:', asset: {identifier: a}, error: {domain: D}}",
        "steps[0].error", "code"},
       {"{plugin: changeAssetID, app: a, stat: X}", "steps[0].stat", "unknown field"},
-      {"{plugin: orderTheItems, apps: 3}", "steps[0].apps", "list"},
       {"{event: hold, service: kitchen}", "steps[0].service", "notifications"},
       {"{event: promise-began, app: a, promise: tomorrow}", "steps[0].promise", "user-data"},
       {"{platform: fail, service: registry, operation: 'nope:'}", "steps[0].operation",

@@ -1,8 +1,7 @@
 // `plugin: NAME`: the plugin's own operations that no host operation reaches yet, called
 // directly so that scripts can exercise them. The list is kept short and shrinks as the host
 // operations that use them land; docs/replay-actions.md lists each with its fields:
-//   changeAssetID (app, state), notifyPavilion (starting), sendIconLayoutToPavilion,
-//   orderTheItems (apps) -> the ordered records, processCaravelRestoreInfoForApp (app,
+//   changeAssetID (app, state), processCaravelRestoreInfoForApp (app,
 //   metadata, sinf, icon) -> bool, setRestoreStateProperty (app, version, key, value),
 //   restoreStateProperty (app, version, key) -> the value (no result when absent),
 //   cleanRestoreState (app), placeholderExists (app) -> bool,
@@ -41,17 +40,6 @@ std::optional<plist::Bytes> optionalData(const StepContext& c, std::string_view 
   return field ? std::optional<plist::Bytes>(readData(*field)) : std::nullopt;
 }
 
-// The candidates of orderTheItems: a list of identifiers (each the record
-// {"BNBundleIdentifier": ID}) or a mapping identifier -> record.
-plist::Dict orderCandidates(const YamlField& field) {
-  if (field.isMap()) return readDict(field);
-  plist::Dict items;
-  for (const std::string& identifier : field.strings()) {
-    items.set(identifier, plist::Dict{{"BNBundleIdentifier", identifier}});
-  }
-  return items;
-}
-
 const std::vector<ActionEntry>& pluginTable() {
   static const std::vector<ActionEntry> table = {
       {"changeAssetID",
@@ -59,24 +47,6 @@ const std::vector<ActionEntry>& pluginTable() {
        [](StepContext& s) -> ActionResult {
          s.session.client().changeAssetID(appOf(s), s.step["state"].string());
          return std::nullopt;
-       }},
-      {"notifyPavilion",
-       {"starting"},
-       [](StepContext& s) -> ActionResult {
-         AppsClient::_notifyPavilion(s.session.device().platform(), s.step["starting"].boolean());
-         return std::nullopt;
-       }},
-      {"sendIconLayoutToPavilion",
-       {},
-       [](StepContext& s) -> ActionResult {
-         AppsClient::_sendIconLayoutToPavilion(s.session.device().platform());
-         return std::nullopt;
-       }},
-      {"orderTheItems",
-       {"apps"},
-       [](StepContext& s) -> ActionResult {
-         plist::Dict items = orderCandidates(s.step["apps"]);
-         return plist::Value(AppsClient::_orderTheItems(s.session.device().platform(), items));
        }},
       {"processCaravelRestoreInfoForApp",
        {"app", "metadata", "sinf", "icon"},
