@@ -169,6 +169,23 @@ TEST(InstallQueue, EachAssertionOutcomeAndInstallFailureEndsAsItShould) {
   }
 }
 
+TEST(InstallQueue, ClassifiesErrorsAndReportsProgressOnlyOnTheLegacyRoad) {
+  for (bool coordination : {false, true}) {
+    SCOPED_TRACE(coordination ? "coordinated" : "legacy");
+    TempDir root;
+    FakePlatform device(root.path(), {.coordination = coordination});
+    device.ar().putApplication({.identifier = "com.example.app", .isPlaceholder = true});
+    AppsClient client(device.platform());
+    EXPECT_FALSE(client._isRecoverableError(makeError(kTRErrorDomain, 5)));
+    device.tr().setRecoverableErrorPredicate([](const ErrorRef&) { return true; });
+    EXPECT_EQ(client._isRecoverableError(makeError(kTRErrorDomain, 5)), !coordination);
+    EXPECT_FALSE(client._isRecoverableError(makeError(kEMInstallerErrorDomain, 5)));
+    EXPECT_FALSE(client._isRecoverableError(makeError(kAppRegistryErrorDomain, 5)));
+    EXPECT_EQ(client._progressForAssetIdentifier("com.example.app") != nullptr, !coordination);
+    EXPECT_EQ(client._progressForAssetIdentifier("com.example.unknown"), nullptr);
+  }
+}
+
 // Holds every package install until `release`, counting how many run at once.
 class GatedRegistry final : public ARApplicationWorkspaceWrapper {
  public:
