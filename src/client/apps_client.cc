@@ -30,6 +30,8 @@ AppsClient::AppsClient(const Platform& platform)
   _placeholdersForRestoringApps.clear();
   _installOperationQueue =
       std::make_unique<OperationQueue>("AppSync install queue", kMaxConcurrentInstalls);
+  globalQueue_ =
+      std::make_unique<DelayedWorkQueue>("global default queue", platform_.system.clock());
   _backupManager = platform_.sw.newManager();
   _accessQueue = std::make_unique<SerialQueue>(std::string(kAccessQueueLabel));
   _restoreQueue = std::make_unique<SerialQueue>(std::string(kRestoreQueueLabel));
@@ -92,6 +94,7 @@ AppsClient::~AppsClient() {
   // for the queue itself.
   _installGroup->wait();
   _installOperationQueue.reset();
+  globalQueue_.reset();
 }
 
 std::vector<std::string> AppsClient::supportedDataclasses() {
@@ -105,7 +108,8 @@ bool AppsClient::respondsTo(TRClientOperation operation) const {
       TRClientOperation::syncEndedWithSuccess,  TRClientOperation::clearSyncData,
       TRClientOperation::installedAssetMetrics, TRClientOperation::vantorIDsForAssets,
       TRClientOperation::accountsForAssets,     TRClientOperation::disabledAssetTypes,
-      TRClientOperation::prepareForBackup,      TRClientOperation::outstandingAssetTransfers};
+      TRClientOperation::prepareForBackup,      TRClientOperation::outstandingAssetTransfers,
+      TRClientOperation::assetInstallSucceeded, TRClientOperation::assetInstallFailed};
   return kImplemented.count(operation) > 0;
 }
 

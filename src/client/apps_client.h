@@ -5,6 +5,7 @@
 #pragma once
 
 #include <atomic>
+#include <chrono>
 #include <cstdint>
 #include <functional>
 #include <memory>
@@ -17,6 +18,7 @@
 
 #include "platform/platform.h"
 #include "platform/tr_client.h"
+#include "runtime/dispatch/delayed_work.h"
 #include "runtime/dispatch/group.h"
 #include "runtime/dispatch/operation_queue.h"
 #include "runtime/dispatch/serial_queue.h"
@@ -36,6 +38,8 @@ inline constexpr std::string_view kInstallObserverServiceName =
 inline constexpr std::string_view kAccessQueueLabel = "com.vantor.kel.Trellis.AppSync";
 inline constexpr std::string_view kRestoreQueueLabel = "com.vantor.kel.Trellis.AppRestore";
 inline constexpr std::size_t kMaxConcurrentInstalls = 10;
+// How long after a denied termination assertion an install is tried again.
+inline constexpr std::chrono::seconds kInstallRetryDelay{30};
 
 class AppsClient : public TRClient,
                    public ARApplicationWorkspaceObserverProtocol,
@@ -119,6 +123,26 @@ class AppsClient : public TRClient,
                                      const std::string& identifier,
                                      const std::optional<std::string>& version);
   void cleanRestoreStateForIdentifier(const std::string& identifier);
+
+  // ---- Install queue (transfer/install_queue.cc) ---------------------------------------------
+  // Legacy road: queues the install of the delivered package at the asset's path on
+  // _installOperationQueue, inside _installGroup. Returns at once.
+  void _enqueueAssetInstall(const std::shared_ptr<TRAsset>& asset);
+  // Takes the termination assertion and installs the package. A denied assertion schedules a
+  // new attempt kInstallRetryDelay later and leaves the package; any other outcome removes it.
+  void _performAssetInstall(const std::shared_ptr<TRAsset>& asset);
+  // Records "INSTALLED" and drops the restore state.
+  void assetInstallSucceeded(const std::shared_ptr<TRAsset>& asset) override;
+  // A recoverable failure (a restore's always is) keeps the todo state and the placeholder; any
+  // other records "FAILED" and removes the application. Drops the restore state either way.
+  void assetInstallFailed(const std::shared_ptr<TRAsset>& asset,
+                          const ErrorRef& withError) override;
+  // False on the coordinated road, and for errors of the installer or the registry.
+  bool _isRecoverableError(const ErrorRef& error);
+  // The registry's loading-phase progress of the application; null on the coordinated road.
+  std::shared_ptr<ARInstallProgress> _progressForAssetIdentifier(const std::string& identifier);
+  // The "operation" of the first todo record of `identifier`.
+  std::optional<std::string> _operationStateForIdentifier(const std::string& identifier);
 
   // ---- Home screen (homescreen/) -------------------------------------------------------------
   // Tells the home screen that a sync starts (true) or is done (false).
@@ -234,6 +258,8 @@ class AppsClient : public TRClient,
   bool useInstallCoordinator() const { return _useInstallCoordinator; }
   bool hasInstallCoordinatorObserver() const;
   bool finishedWaitingForPlaceHolderInstalls();
+  // Blocks until no legacy install is queued, running or waiting for its retry.
+  void waitForInstalls() { _installGroup->wait(); }
   std::string describe() const;
 
  private:
@@ -277,6 +303,8 @@ class AppsClient : public TRClient,
   std::set<std::string> _outstandingPFTTransfers;
   // Runs the legacy install operations, at most kMaxConcurrentInstalls at once.
   std::unique_ptr<OperationQueue> _installOperationQueue;
+  // Runs the retries of denied installs once their time comes, on the platform's clock.
+  std::unique_ptr<DelayedWorkQueue> globalQueue_;
   // The backup service's manager, kept for the client's lifetime.
   std::shared_ptr<SWManager> _backupManager;
   // Apps whose transfer updates an installed app. Guard: _accessQueue. Writers: outstanding

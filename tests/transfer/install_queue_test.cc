@@ -1,0 +1,303 @@
+// The legacy install queue: assertion outcomes, install failures, the concurrency limit and the
+// retries after a denied assertion, driven by the manual clock.
+#include <gtest/gtest.h>
+
+#include <condition_variable>
+#include <filesystem>
+#include <memory>
+#include <mutex>
+#include <thread>
+
+#include "client/apps_client.h"
+#include "platform/ar_wrapper.h"
+#include "platform/fake/fake_platform.h"
+#include "runtime/fs/files.h"
+#include "support/temp_dir.h"
+
+namespace appsync {
+namespace {
+
+namespace fs = std::filesystem;
+using testing::TempDir;
+
+// A delivered bundle folder for `identifier` under ROOT/staging; its path.
+std::string writePackage(const fs::path& root, const std::string& identifier) {
+  const std::string bundle = (root / "staging" / (identifier + ".app")).string();
+  EXPECT_TRUE(createDirectories(bundle));
+  EXPECT_TRUE(writePlistAtomically(bundle + "/Info.plist",
+                                   plist::Dict{{"BNBundleIdentifier", identifier}},
+                                   plist::Format::Binary));
+  return bundle;
+}
+
+std::string writeBadPackage(const fs::path& root, const std::string& identifier) {
+  const std::string archive = (root / "staging" / (identifier + ".zip")).string();
+  EXPECT_TRUE(createDirectories((root / "staging").string()));
+  const plist::Bytes garbage{'n', 'o', 't', ' ', 'z', 'i', 'p'};
+  EXPECT_TRUE(writeFileAtomically(archive, garbage));
+  return archive;
+}
+
+void writeTodoList(FakePlatform& device, const std::vector<std::string>& identifiers) {
+  plist::Array records;
+  for (const auto& id : identifiers) {
+    records.emplace_back(plist::Dict{{"identifier", id}, {"operation", "install"}});
+  }
+  ASSERT_TRUE(createDirectories(device.paths().syncFolder()));
+  ASSERT_TRUE(writePlistAtomically(device.paths().todoList(), records, plist::Format::Binary));
+}
+
+std::shared_ptr<TRAsset> makeAsset(const std::string& identifier, const std::string& path,
+                                   bool restore = false) {
+  auto asset = TRAsset::downloadAssetWithIdentifier(identifier, "Application", std::nullopt);
+  asset->setPath(path);
+  asset->setIsRestore(restore);
+  return asset;
+}
+
+std::vector<std::string> scenarioDescriptions(FakePlatform& device) {
+  std::vector<std::string> out;
+  for (const auto& entry : device.transactionLog().entries()) {
+    if (entry.kind == TransactionLogEntry::Kind::Scenario)
+      out.push_back(entry.scenario + ": " + entry.description);
+  }
+  return out;
+}
+
+TEST(InstallQueue, EachAssertionOutcomeAndInstallFailureEndsAsItShould) {
+  struct Case {
+    const char* name;
+    std::vector<std::int32_t> outcomes;
+    bool badPackage;
+    bool restore;
+    bool frameworkCallsEverythingRecoverable;
+    std::size_t installCalls;
+    std::uint32_t attempts;
+    std::string todoState;
+    std::vector<std::string> scenarios;
+  };
+  const std::vector<Case> cases = {
+      {"granted",
+       {0},
+       false,
+       false,
+       false,
+       1,
+       1,
+       "INSTALLED",
+       {"Asset install: assertion succeeded"}},
+      {"not found installs anyway",
+       {2},
+       false,
+       false,
+       false,
+       1,
+       1,
+       "INSTALLED",
+       {"Asset install: assertion not found"}},
+      {"unknown outcome never installs",
+       {7},
+       false,
+       false,
+       false,
+       0,
+       0,
+       "FAILED",
+       {"Asset install: unknown error grabbing assertion",
+        "Halvard restore: failed to remove placeholder"}},
+      {"unknown outcome, recoverable",
+       {7},
+       false,
+       false,
+       true,
+       0,
+       0,
+       "install",
+       {"Asset install: unknown error grabbing assertion",
+        "Halvard restore: install failed recoverably"}},
+      {"bad package counts as an attempt",
+       {0},
+       true,
+       false,
+       false,
+       1,
+       1,
+       "FAILED",
+       {"Asset install: assertion succeeded", "Halvard restore: failed to remove placeholder"}},
+      {"registry errors are never recoverable",
+       {0},
+       true,
+       false,
+       true,
+       1,
+       1,
+       "FAILED",
+       {"Asset install: assertion succeeded", "Halvard restore: failed to remove placeholder"}},
+      {"a restore always recovers",
+       {0},
+       true,
+       true,
+       false,
+       1,
+       1,
+       "install",
+       {"Asset install: assertion succeeded", "Halvard restore: install failed recoverably"}},
+  };
+  for (const Case& c : cases) {
+    SCOPED_TRACE(c.name);
+    TempDir root;
+    FakePlatform device(root.path());
+    const std::string id = "com.example.app";
+    writeTodoList(device, {id});
+    const std::string package =
+        c.badPackage ? writeBadPackage(root.path(), id) : writePackage(root.path(), id);
+    device.pv().scriptAssertionOutcomes(id, c.outcomes);
+    if (c.frameworkCallsEverythingRecoverable) {
+      device.tr().setRecoverableErrorPredicate([](const ErrorRef&) { return true; });
+    }
+    AppsClient client(device.platform());
+    client._enqueueAssetInstall(makeAsset(id, package, c.restore));
+    client.waitForInstalls();
+    EXPECT_EQ(client._operationStateForIdentifier(id), c.todoState);
+    EXPECT_EQ(device.ar().installCalls().size(), c.installCalls);
+    EXPECT_EQ(client._getAndResetNumAppInstallsAttempted(), c.attempts);
+    EXPECT_FALSE(fs::exists(package));
+    EXPECT_EQ(device.pv().liveAssertions(), 0u);
+    EXPECT_EQ(scenarioDescriptions(device), c.scenarios);
+    // Restores and recoverable failures keep the placeholder: no uninstall is asked for.
+    EXPECT_EQ(device.ar().uninstallCalls().size(), c.todoState == "FAILED" ? 1u : 0u);
+  }
+}
+
+TEST(InstallQueue, ClassifiesErrorsAndReportsProgressOnlyOnTheLegacyRoad) {
+  for (bool coordination : {false, true}) {
+    SCOPED_TRACE(coordination ? "coordinated" : "legacy");
+    TempDir root;
+    FakePlatform device(root.path(), {.coordination = coordination});
+    device.ar().putApplication({.identifier = "com.example.app", .isPlaceholder = true});
+    AppsClient client(device.platform());
+    EXPECT_FALSE(client._isRecoverableError(makeError(kTRErrorDomain, 5)));
+    device.tr().setRecoverableErrorPredicate([](const ErrorRef&) { return true; });
+    EXPECT_EQ(client._isRecoverableError(makeError(kTRErrorDomain, 5)), !coordination);
+    EXPECT_FALSE(client._isRecoverableError(makeError(kEMInstallerErrorDomain, 5)));
+    EXPECT_FALSE(client._isRecoverableError(makeError(kAppRegistryErrorDomain, 5)));
+    EXPECT_EQ(client._progressForAssetIdentifier("com.example.app") != nullptr, !coordination);
+    EXPECT_EQ(client._progressForAssetIdentifier("com.example.unknown"), nullptr);
+  }
+}
+
+// Holds every package install until `release`, counting how many run at once.
+class GatedRegistry final : public ARApplicationWorkspaceWrapper {
+ public:
+  using ARApplicationWorkspaceWrapper::ARApplicationWorkspaceWrapper;
+  using ARApplicationWorkspaceWrapper::installApplication;
+
+  bool installApplication(const std::string& path, const plist::Dict& options,
+                          ErrorRef* error) override {
+    {
+      std::unique_lock lock(mutex_);
+      ++inFlight_;
+      peak_ = std::max(peak_, inFlight_);
+      changed_.notify_all();
+      changed_.wait(lock, [&] { return open_; });
+    }
+    const bool ok = target().installApplication(path, options, error);
+    std::lock_guard lock(mutex_);
+    --inFlight_;
+    return ok;
+  }
+  void waitForInFlight(std::size_t n) {
+    std::unique_lock lock(mutex_);
+    changed_.wait(lock, [&] { return inFlight_ >= n; });
+  }
+  void release() {
+    std::lock_guard lock(mutex_);
+    open_ = true;
+    changed_.notify_all();
+  }
+  std::size_t peak() const {
+    std::lock_guard lock(mutex_);
+    return peak_;
+  }
+
+ private:
+  mutable std::mutex mutex_;
+  std::condition_variable changed_;
+  std::size_t inFlight_ = 0, peak_ = 0;
+  bool open_ = false;
+};
+
+TEST(InstallQueue, RunsAtMostTenInstallsAndLosesNoTodoChangeWhenTheyFinishTogether) {
+  TempDir root;
+  FakePlatform device(root.path());
+  GatedRegistry registry(device.ar());
+  std::vector<std::string> ids;
+  for (int i = 0; i < 25; ++i) ids.push_back("com.example.app" + std::to_string(i));
+  writeTodoList(device, ids);
+  AppsClient client(device.platform().with(registry));
+  for (const auto& id : ids) {
+    client._enqueueAssetInstall(makeAsset(id, writePackage(root.path(), id)));
+  }
+  registry.waitForInFlight(kMaxConcurrentInstalls);
+  registry.release();
+  client.waitForInstalls();
+  EXPECT_EQ(registry.peak(), kMaxConcurrentInstalls);
+  EXPECT_EQ(client._getAndResetNumAppInstallsAttempted(), ids.size());
+  for (const auto& id : ids) EXPECT_EQ(client._operationStateForIdentifier(id), "INSTALLED") << id;
+}
+
+TEST(InstallQueue, RetriesADeniedAssertionEveryThirtySecondsUntilItIsGranted) {
+  TempDir root;
+  FakePlatform device(root.path());
+  ManualClock& clock = *device.manualClock();
+  const std::string id = "com.example.app";
+  const std::string retryLine =
+      std::string(kPluginBundleIdentifier) + "|Will retry installation of " + id + " in 30 seconds";
+  writeTodoList(device, {id});
+  const std::string package = writePackage(root.path(), id);
+  device.pv().scriptAssertionOutcomes(id, {1, 1, 1});
+  {
+    AppsClient client(device.platform());
+    client._enqueueAssetInstall(makeAsset(id, package));
+    for (int denial = 1; denial <= 3; ++denial) {
+      SCOPED_TRACE(denial);
+      clock.waitForWaiters(1);  // the retry is scheduled
+      EXPECT_EQ(clock.earliestDeadline(), clock.now() + kInstallRetryDelay);
+      EXPECT_EQ(device.log().count(retryLine), static_cast<std::size_t>(denial));
+      EXPECT_TRUE(fs::exists(package));
+      EXPECT_TRUE(device.ar().installCalls().empty());
+      EXPECT_EQ(client._getAndResetNumAppInstallsAttempted(), 0u);
+      clock.advance(kInstallRetryDelay);
+      clock.waitForDueWaiters();
+    }
+    client.waitForInstalls();  // the fourth request is granted
+    EXPECT_EQ(client._getAndResetNumAppInstallsAttempted(), 1u);
+  }
+  EXPECT_EQ(device.pv().assertionRequests(id), 4u);
+  EXPECT_EQ(device.log().count(retryLine), 3u);
+  EXPECT_EQ(device.ar().installCalls().size(), 1u);
+  EXPECT_FALSE(fs::exists(package));
+  EXPECT_EQ(AppsClient(device.platform())._operationStateForIdentifier(id), "INSTALLED");
+}
+
+TEST(InstallQueue, TeardownWhileARetryWaitsLetsTheRetryRunFirst) {
+  TempDir root;
+  FakePlatform device(root.path());
+  ManualClock& clock = *device.manualClock();
+  const std::string id = "com.example.app";
+  writeTodoList(device, {id});
+  const std::string package = writePackage(root.path(), id);
+  device.pv().scriptAssertionOutcomes(id, {1});
+  auto client = std::make_unique<AppsClient>(device.platform());
+  client->_enqueueAssetInstall(makeAsset(id, package));
+  clock.waitForWaiters(1);
+  std::thread teardown([&] { client.reset(); });
+  clock.advance(kInstallRetryDelay);
+  teardown.join();
+  EXPECT_EQ(device.ar().installCalls().size(), 1u);
+  EXPECT_FALSE(fs::exists(package));
+  EXPECT_EQ(AppsClient(device.platform())._operationStateForIdentifier(id), "INSTALLED");
+}
+
+}  // namespace
+}  // namespace appsync
