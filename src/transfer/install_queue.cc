@@ -4,7 +4,9 @@
 #include <cerrno>
 
 #include "client/apps_client.h"
+#include "platform/bundle_keys.h"
 #include "runtime/fs/files.h"
+#include "state/todo_list.h"
 
 namespace appsync {
 namespace {
@@ -75,7 +77,7 @@ void AppsClient::_performAssetInstall(const std::shared_ptr<TRAsset>& asset) {
   const std::optional<std::string> path = asset->path();
   if (outcome == kPVSAssertionGranted || outcome == kPVSAssertionApplicationNotFound) {
     const plist::Dict options{{std::string(ARPackageTypeKey), std::string(ARPackageTypeCustomer)},
-                              {"BNBundleIdentifier", identifier}};
+                              {std::string(kBNBundleIdentifierKey), identifier}};
     ErrorRef error;
     if (platform_.ar.installApplication(path.value_or(std::string()), options, &error)) {
       assetInstallSucceeded(asset);
@@ -91,7 +93,7 @@ void AppsClient::_performAssetInstall(const std::shared_ptr<TRAsset>& asset) {
 void AppsClient::assetInstallSucceeded(const std::shared_ptr<TRAsset>& asset) {
   const std::string identifier = asset->identifier();
   logDefault("%s|%{public}@ install succeeded", identifier);
-  changeAssetID(identifier, "INSTALLED");
+  changeAssetID(identifier, std::string(kTodoInstalled));
   cleanRestoreStateForIdentifier(identifier);
 }
 
@@ -106,7 +108,7 @@ void AppsClient::assetInstallFailed(const std::shared_ptr<TRAsset>& asset,
                                          "install failed recoverably");
   } else {
     logDefault("%s|%{public}@ install failed unrecoverably: %{public}@", identifier, withError);
-    changeAssetID(identifier, "FAILED");
+    changeAssetID(identifier, std::string(kTodoFailed));
     if (_useInstallCoordinator) {
       uninstallAppUsingCoordination(identifier);
     } else if (platform_.ar.uninstallApplication(identifier, std::nullopt)) {
@@ -151,19 +153,10 @@ std::optional<std::string> AppsClient::_operationStateForIdentifier(const std::s
   const std::optional<plist::Array> toDoList =
       _loadPlist(platform_.tr, platform_.paths.todoList(), nullptr);
   if (!toDoList) return std::nullopt;
-  for (const plist::Value& record : *toDoList) {
-    const plist::Dict* fields = record.dict();
-    if (!fields) continue;
-    const plist::Value* recordIdentifier = fields->find("identifier");
-    if (!recordIdentifier || !recordIdentifier->string() ||
-        *recordIdentifier->string() != identifier) {
-      continue;
-    }
-    const plist::Value* operation = fields->find("operation");
-    if (operation && operation->string()) return *operation->string();
-    return std::nullopt;
-  }
-  return std::nullopt;
+  const plist::Dict* record = findTodoRecord(*toDoList, identifier);
+  const std::string* operation = record ? plist::stringAt(*record, kTodoOperationKey) : nullptr;
+  if (!operation) return std::nullopt;
+  return *operation;
 }
 
 }  // namespace appsync
