@@ -133,9 +133,9 @@ std::vector<std::shared_ptr<TRAsset>> AppsClient::outstandingAssetTransfers() {
   for (const plist::Value& item : todoList.value_or(plist::Array{})) {
     const plist::Dict* record = item.dict();
     if (!record) continue;
-    const std::string* operation = plist::stringAt(*record, "operation");
-    if (!operation || *operation != "install") continue;
-    const plist::Value* identifierValue = record->find("identifier");
+    const std::string* operation = plist::stringAt(*record, kTodoOperationKey);
+    if (!operation || *operation != kTodoInstall) continue;
+    const plist::Value* identifierValue = record->find(kTodoIdentifierKey);
     // Beyond the documented test, the identifier names a folder of the sync folder: one that
     // would leave it, directly or through a link, is refused the same way.
     std::optional<std::string> packageDirectory;
@@ -312,7 +312,7 @@ std::vector<std::shared_ptr<TRAsset>> AppsClient::outstandingAssetTransfers() {
         });
       } else {
         logError("%s|Not requesting app asset for %{public}@", *identifier);
-        changeAssetID(*identifier, "FAILED");
+        changeAssetID(*identifier, std::string(kTodoFailed));
       }
       continue;
     }
