@@ -90,8 +90,11 @@ AppsClient::~AppsClient() {
   // The coordination service holds the client as an observer of its coordinators.
   platform_.kc.removeObserver(this);
 
-  // Installs hold the client: wait for every one queued, running or waiting for a retry, then
-  // for the queue itself.
+  // Installs hold the client. Retries still waiting are dropped and queued installs that have
+  // not started skip their work; both stay as they are for the next sync. Installs already
+  // running finish; then the queues go.
+  tearingDown_.store(true);
+  globalQueue_->stop();
   _installGroup->wait();
   _installOperationQueue.reset();
   globalQueue_.reset();

@@ -48,9 +48,10 @@ class AppsClient : public TRClient,
   // Builds every field, registers with the registry, initialises the transaction log, chooses
   // the installation road and, inside the host daemon, listens for its start-up notification.
   explicit AppsClient(const Platform& platform);
-  // Logs unfinished work, unregisters from every service (each waits for its callbacks in
-  // flight), then waits for every install queued, running or waiting for a retry, so that
-  // nothing that holds the client outlives it.
+  // Logs unfinished work and unregisters from every service (each waits for its callbacks in
+  // flight). Installs already running finish; queued installs that have not started and retries
+  // still waiting are dropped, leaving their package, todo state and placeholder for the next
+  // sync. Nothing that holds the client outlives it.
   ~AppsClient() override;
   AppsClient(const AppsClient&) = delete;
   AppsClient& operator=(const AppsClient&) = delete;
@@ -305,6 +306,8 @@ class AppsClient : public TRClient,
   std::unique_ptr<OperationQueue> _installOperationQueue;
   // Runs the retries of denied installs once their time comes, on the platform's clock.
   std::unique_ptr<DelayedWorkQueue> globalQueue_;
+  // Set when teardown begins: installs that have not started are left for the next sync.
+  std::atomic<bool> tearingDown_{false};
   // The backup service's manager, kept for the client's lifetime.
   std::shared_ptr<SWManager> _backupManager;
   // Apps whose transfer updates an installed app. Guard: _accessQueue. Writers: outstanding

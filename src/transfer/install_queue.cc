@@ -20,6 +20,12 @@ void AppsClient::_enqueueAssetInstall(const std::shared_ptr<TRAsset>& asset) {
   // The operation holds the asset; the client outlives it because its teardown waits on the
   // group.
   auto operation = [this, asset] {
+    // A client being torn down starts no install: the package, the todo state, the placeholder
+    // and the restore state stay as they are for the next sync.
+    if (tearingDown_.load()) {
+      _installGroup->leave();
+      return;
+    }
     const std::string identifier = asset->identifier();
     logDefault("%s|Performing install for %{public}@", identifier);
     _performAssetInstall(asset);
@@ -56,12 +62,12 @@ void AppsClient::_performAssetInstall(const std::shared_ptr<TRAsset>& asset) {
       logError("%s|Will retry installation of %{public}@ in %d seconds", identifier, delaySeconds);
       platform_.transactionLog.logScenario(scenario, 0, true, identifier, "retrying asset install");
       // Entered before this install's operation leaves, so the group never empties between the
-      // denial and the retry. The package stays for the retry.
-      _installGroup->enter();
-      globalQueue_->after(kInstallRetryDelay, [this, asset] {
+      // denial and the retry. The package stays for the retry. A teardown drops the retry unrun,
+      // and its membership leaves with it.
+      auto membership = std::make_shared<GroupMembership>(*_installGroup);
+      globalQueue_->after(kInstallRetryDelay, [this, asset, membership] {
         logDefault("%s|Re-enqueue installation request for %{public}@", asset->identifier());
         _enqueueAssetInstall(asset);
-        _installGroup->leave();
       });
       return;
     }

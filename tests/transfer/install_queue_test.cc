@@ -280,23 +280,36 @@ TEST(InstallQueue, RetriesADeniedAssertionEveryThirtySecondsUntilItIsGranted) {
   EXPECT_EQ(AppsClient(device.platform())._operationStateForIdentifier(id), "INSTALLED");
 }
 
-TEST(InstallQueue, TeardownWhileARetryWaitsLetsTheRetryRunFirst) {
+TEST(InstallQueue, TeardownFinishesRunningInstallsAndLeavesAWaitingRetryForTheNextSync) {
   TempDir root;
   FakePlatform device(root.path());
   ManualClock& clock = *device.manualClock();
-  const std::string id = "com.example.app";
-  writeTodoList(device, {id});
-  const std::string package = writePackage(root.path(), id);
-  device.pv().scriptAssertionOutcomes(id, {1});
-  auto client = std::make_unique<AppsClient>(device.platform());
-  client->_enqueueAssetInstall(makeAsset(id, package));
-  clock.waitForWaiters(1);
+  GatedRegistry registry(device.ar());
+  std::vector<std::string> running;
+  for (int i = 0; i < 10; ++i) running.push_back("com.example.app" + std::to_string(i));
+  const std::string denied = "com.example.denied";
+  std::vector<std::string> all = running;
+  all.push_back(denied);
+  writeTodoList(device, all);
+  const std::string deniedPackage = writePackage(root.path(), denied);
+  device.pv().scriptAssertionOutcomes(denied, {1});
+
+  auto client = std::make_unique<AppsClient>(device.platform().with(registry));
+  client->_enqueueAssetInstall(makeAsset(denied, deniedPackage));
+  clock.waitForWaiters(1);  // the retry waits for its 30 seconds
+  for (const auto& id : running) {
+    client->_enqueueAssetInstall(makeAsset(id, writePackage(root.path(), id)));
+  }
+  registry.waitForInFlight(running.size());
   std::thread teardown([&] { client.reset(); });
-  clock.advance(kInstallRetryDelay);
-  teardown.join();
-  EXPECT_EQ(device.ar().installCalls().size(), 1u);
-  EXPECT_FALSE(fs::exists(package));
-  EXPECT_EQ(AppsClient(device.platform())._operationStateForIdentifier(id), "INSTALLED");
+  registry.release();
+  teardown.join();  // without the clock moving: the retry is not waited for
+
+  EXPECT_EQ(device.ar().installCalls().size(), running.size());
+  EXPECT_TRUE(fs::exists(deniedPackage));
+  AppsClient next(device.platform());
+  EXPECT_EQ(next._operationStateForIdentifier(denied), "install");
+  for (const auto& id : running) EXPECT_EQ(next._operationStateForIdentifier(id), "INSTALLED");
 }
 
 }  // namespace

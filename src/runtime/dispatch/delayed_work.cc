@@ -10,7 +10,9 @@ DelayedWorkQueue::DelayedWorkQueue(std::string name, Clock& clock)
   timer_ = std::thread([this] { timerLoop(); });
 }
 
-DelayedWorkQueue::~DelayedWorkQueue() {
+DelayedWorkQueue::~DelayedWorkQueue() { stop(); }
+
+void DelayedWorkQueue::stop() {
   std::multimap<TimePoint, std::function<void()>> dropped;
   {
     std::lock_guard<std::mutex> guard(mutex_);
@@ -19,9 +21,11 @@ DelayedWorkQueue::~DelayedWorkQueue() {
   }
   cv_.notify_all();
   dueReady_.notify_all();
-  timer_.join();
+  if (timer_.joinable()) timer_.join();
   // Only the timer starts runners, so the vector no longer changes.
-  for (std::thread& runner : runners_) runner.join();
+  for (std::thread& runner : runners_) {
+    if (runner.joinable()) runner.join();
+  }
   // `dropped` is destroyed here, outside the lock: what the items captured may do anything.
 }
 

@@ -19,15 +19,18 @@ namespace appsync {
 class DelayedWorkQueue {
  public:
   DelayedWorkQueue(std::string name, Clock& clock);
-  // Drops items whose time has not come; items already due still run. Waits for running items
-  // to finish and joins every thread of the queue.
+  // Stops the queue (below).
   ~DelayedWorkQueue();
   DelayedWorkQueue(const DelayedWorkQueue&) = delete;
   DelayedWorkQueue& operator=(const DelayedWorkQueue&) = delete;
 
   // Runs `work` once `delay` has passed on the clock (measured from now). Items with the same
-  // time start in the order they were added. Ignored once the queue is being destroyed.
+  // time start in the order they were added. Ignored (and `work` destroyed) once stopped.
   void after(Duration delay, std::function<void()> work);
+  // Drops items whose time has not come (destroying them unrun); items already due still run.
+  // Waits for running items to finish and joins every thread of the queue. Later items are
+  // ignored. Call it from outside the queue's own items; calling it again does nothing.
+  void stop();
   // Runs `work` as soon as possible on a thread of the queue.
   void async(std::function<void()> work) { after(Duration::zero(), std::move(work)); }
 

@@ -31,4 +31,18 @@ class Group {
   std::int64_t count_ = 0;
 };
 
+// One membership of a group, held for as long as this object lives: entered at construction,
+// left at destruction. Lets work that may be dropped unrun (a closure destroyed by its queue)
+// still leave the group.
+class GroupMembership {
+ public:
+  explicit GroupMembership(Group& group) : group_(group) { group_.enter(); }
+  ~GroupMembership() { group_.leave(); }
+  GroupMembership(const GroupMembership&) = delete;
+  GroupMembership& operator=(const GroupMembership&) = delete;
+
+ private:
+  Group& group_;
+};
+
 }  // namespace appsync
