@@ -107,12 +107,21 @@ std::vector<std::string> AppsClient::supportedDataclasses() {
 bool AppsClient::respondsTo(TRClientOperation operation) const {
   // The optional operations this client implements; the others abort when called.
   static const std::set<TRClientOperation> kImplemented = {
-      TRClientOperation::installedAssets,       TRClientOperation::reconcileSync,
-      TRClientOperation::syncEndedWithSuccess,  TRClientOperation::clearSyncData,
-      TRClientOperation::installedAssetMetrics, TRClientOperation::vantorIDsForAssets,
-      TRClientOperation::accountsForAssets,     TRClientOperation::disabledAssetTypes,
-      TRClientOperation::prepareForBackup,      TRClientOperation::outstandingAssetTransfers,
-      TRClientOperation::assetInstallSucceeded, TRClientOperation::assetInstallFailed};
+      TRClientOperation::installedAssets,
+      TRClientOperation::reconcileSync,
+      TRClientOperation::syncEndedWithSuccess,
+      TRClientOperation::clearSyncData,
+      TRClientOperation::installedAssetMetrics,
+      TRClientOperation::vantorIDsForAssets,
+      TRClientOperation::accountsForAssets,
+      TRClientOperation::disabledAssetTypes,
+      TRClientOperation::prepareForBackup,
+      TRClientOperation::outstandingAssetTransfers,
+      TRClientOperation::assetInstallSucceeded,
+      TRClientOperation::assetInstallFailed,
+      TRClientOperation::assetTransferSucceeded,
+      TRClientOperation::assetTransferUpdatedProgress,
+      TRClientOperation::assetTransferEndedWithSuccess};
   return kImplemented.count(operation) > 0;
 }
 

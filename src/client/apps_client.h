@@ -145,6 +145,19 @@ class AppsClient : public TRClient,
   // The "operation" of the first todo record of `identifier`.
   std::optional<std::string> _operationStateForIdentifier(const std::string& identifier);
 
+  // ---- Transfer completion (transfer/transfer_completion.cc) ---------------------------------
+  // The host's progress (0 to 1) for one transfer: the registry's install progress in units of
+  // 1000 (legacy road) or the coordinated progress; the transfer counts as outstanding.
+  void assetTransfer(const std::shared_ptr<TRAsset>& asset, double updatedProgress) override;
+  // One transfer ended. A delivered package is installed (or, for a restore with backup data,
+  // kept until its data part arrives); an upload is marked "SENT"; a failed transfer leaves the
+  // placeholder when recoverable or for a restore, and removes it otherwise.
+  void assetTransfer(const std::shared_ptr<TRAsset>& asset, bool succeeded,
+                     const ErrorRef& withError) override;
+  // The transfer phase is over: waits for every legacy install, tells the home screen, refreshes
+  // the store receipts after installs, and settles the transfers that never ended.
+  void assetTransferEndedWithSuccess(bool success) override;
+
   // ---- Home screen (homescreen/) -------------------------------------------------------------
   // Tells the home screen that a sync starts (true) or is done (false).
   static void _notifyPavilion(const Platform& platform, bool starting);
@@ -261,6 +274,9 @@ class AppsClient : public TRClient,
   bool finishedWaitingForPlaceHolderInstalls();
   // Blocks until no legacy install is queued, running or waiting for its retry.
   void waitForInstalls() { _installGroup->wait(); }
+  // Blocks until no legacy install is queued or running and no retry is due or running; retries
+  // whose time has not come stay. True when there was such work to wait for.
+  bool waitForRunnableInstalls();
   std::string describe() const;
 
  private:
@@ -285,6 +301,14 @@ class AppsClient : public TRClient,
   bool _replaceSyncFolderWithStagingArea(ErrorRef* error, bool* nothingStaged);
   // Removes the apps the todo list's "remove" records name, on the client's road.
   void _performDeletions(const plist::Array& toDoList);
+
+  // The two outcomes of one transfer (transfer/transfer_completion.cc). `progress` is the
+  // registry's install progress (legacy road) or null.
+  void _transferSucceeded(const std::shared_ptr<TRAsset>& asset,
+                          const std::shared_ptr<ARInstallProgress>& progress, bool existingApp);
+  void _transferFailed(const std::shared_ptr<TRAsset>& asset, const ErrorRef& error,
+                       const std::shared_ptr<ARInstallProgress>& progress, bool existingApp,
+                       bool userCancelled);
 
   const Platform platform_;
 

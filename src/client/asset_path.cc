@@ -36,4 +36,10 @@ bool resolvesInside(const std::string& base, std::string_view name) {
   return mismatch.first == resolvedBase.end();
 }
 
+bool resolvesInsideRoot(const std::string& path, const std::filesystem::path& root) {
+  const std::filesystem::path name = std::filesystem::path(path).lexically_relative(root);
+  if (name.empty() || *name.begin() == "..") return false;
+  return resolvesInside(root.string(), name.string());
+}
+
 }  // namespace appsync

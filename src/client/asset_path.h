@@ -2,6 +2,7 @@
 // host's own test of such names, isValidAssetPath, is in state/todo_list.h.)
 #pragma once
 
+#include <filesystem>
 #include <string>
 #include <string_view>
 
@@ -12,5 +13,10 @@ namespace appsync {
 // fails. `name` is relative. Links are resolved only when `name` passes through one, so the
 // common case costs one lstat per component of `name`.
 bool resolvesInside(const std::string& base, std::string_view name);
+
+// True when the absolute `path`, its links resolved (as far as it exists), lies inside the
+// device root: a place reached through a link out of the root is not ours to remove, create,
+// move from or move into.
+bool resolvesInsideRoot(const std::string& path, const std::filesystem::path& root);
 
 }  // namespace appsync

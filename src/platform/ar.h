@@ -172,8 +172,8 @@ class ARApplicationWorkspace {
   // does not wait for that callback, which is the caller's own.
   virtual void removeObserver(ARApplicationWorkspaceObserverProtocol* observer) = 0;
 
-  // True for a fully installed application; false for an unknown identifier, a placeholder, a
-  // bundle that is not an application, or a failed query.
+  // True for an application the registry holds, fully installed or a placeholder; false for an
+  // unknown identifier, a bundle that is not an application, or a failed query.
   virtual bool applicationIsInstalled(const std::string& identifier) = 0;
   // Removes the application; applicationsDidUninstall follows. False, with nothing removed, for
   // an unknown identifier, a bundle that is not an application, or a refusal. `options` may be

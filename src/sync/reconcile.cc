@@ -23,15 +23,6 @@ bool isLink(const std::string& path) {
   return ::lstat(path.c_str(), &status) == 0 && S_ISLNK(status.st_mode);
 }
 
-// True when `path`, its links resolved (as far as it exists), lies inside the resolved device
-// root: a directory reached through a link out of the root is not ours to remove, create, move
-// from or move into.
-bool resolvesInsideRoot(const std::string& path, const std::filesystem::path& root) {
-  const std::filesystem::path name = std::filesystem::path(path).lexically_relative(root);
-  if (name.empty() || *name.begin() == "..") return false;
-  return resolvesInside(root.string(), name.string());
-}
-
 }  // namespace
 
 bool AppsClient::reconcileSync(std::uint32_t /*syncType*/, const std::string& newAnchor,

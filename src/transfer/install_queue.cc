@@ -128,6 +128,18 @@ void AppsClient::assetInstallFailed(const std::shared_ptr<TRAsset>& asset,
   cleanRestoreStateForIdentifier(identifier);
 }
 
+bool AppsClient::waitForRunnableInstalls() {
+  // A retry that comes due queues an install, and an install may schedule a retry: go round
+  // until neither queue has anything to do now.
+  bool waited = false;
+  for (;;) {
+    globalQueue_->waitUntilIdle();
+    if (_installOperationQueue->unfinishedCount() == 0) return waited;
+    waited = true;
+    _installOperationQueue->waitUntilAllOperationsAreFinished();
+  }
+}
+
 bool AppsClient::_isRecoverableError(const ErrorRef& error) {
   if (_useInstallCoordinator) {
     logDefault("%s|InstallCoordination is enabled - treating error %{public}@ as non recoverable",

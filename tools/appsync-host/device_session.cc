@@ -224,8 +224,17 @@ bool DeviceSession::holdService(std::string_view name, bool hold) {
 void DeviceSession::settle(bool releaseHeld) {
   // Each delivery may make more (an observer that calls back into a service): go round until a
   // whole round finds nothing queued.
+  // The client's own install queues count too: an install calls the registry, whose events
+  // must then be delivered.
   for (int round = 0; round < 1000; ++round) {
-    if (!settleOnce(*device_, releaseHeld) && round > 0) return;
+    bool busy = settleOnce(*device_, releaseHeld);
+    AppsClient* client = nullptr;
+    {
+      std::lock_guard lock(clientMutex_);
+      client = client_.get();
+    }
+    if (client) busy = client->waitForRunnableInstalls() || busy;
+    if (!busy && round > 0) return;
   }
   throw std::runtime_error("the device does not come to rest: its services keep making events");
 }

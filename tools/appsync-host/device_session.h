@@ -48,7 +48,8 @@ class DeviceSession {
   bool hasClient() const;
 
   // Waits until no fake has anything left to deliver, except the services whose deliveries a
-  // script holds back: those keep their events until they are released.
+  // script holds back (those keep their events until they are released), and the client has no
+  // install to run now (retries waiting for the clock stay).
   void settle();
   // The services whose deliveries a script holds back now ("registry", "coordination",
   // "notifications", "host", "store").

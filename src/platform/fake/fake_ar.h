@@ -123,6 +123,9 @@ class FakeARWorkspace final : public ARApplicationWorkspace, public FakeService 
   // state and phase to shape what observers see.
   std::shared_ptr<ARInstallProgress> installProgress(const std::string& identifier,
                                                      std::uint64_t phase);
+  // The application's current install progress (the one its proxies report), without making
+  // one; null when there is none, as after a completed package install.
+  std::shared_ptr<ARInstallProgress> currentInstallProgress(const std::string& identifier) const;
   // Progress objects passed to installPhaseFinishedForProgress, in call order.
   std::vector<std::shared_ptr<ARInstallProgress>> finishedPhases() const;
 

@@ -37,6 +37,13 @@ void FakeARWorkspace::installPhaseFinishedForProgress(
   finishedPhases_.push_back(progress);
 }
 
+std::shared_ptr<ARInstallProgress> FakeARWorkspace::currentInstallProgress(
+    const std::string& identifier) const {
+  std::lock_guard lock(mutex_);
+  const Entry* e = findLocked(identifier);
+  return e ? e->currentProgress : nullptr;
+}
+
 std::vector<std::shared_ptr<ARInstallProgress>> FakeARWorkspace::finishedPhases() const {
   std::lock_guard lock(mutex_);
   return finishedPhases_;

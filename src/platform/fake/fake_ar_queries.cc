@@ -8,7 +8,7 @@ bool FakeARWorkspace::applicationIsInstalled(const std::string& identifier) {
   if (beginCall(kIsInstalled)) return false;
   std::lock_guard lock(mutex_);
   const Entry* e = findLocked(identifier);
-  return e && e->record.isApplication && !e->record.isPlaceholder;
+  return e && e->record.isApplication;
 }
 
 void FakeARWorkspace::enumerateBundlesOfType(int type, const BundleBlock& block) {

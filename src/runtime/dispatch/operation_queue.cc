@@ -55,6 +55,11 @@ void OperationQueue::waitUntilAllOperationsAreFinished() {
   idle_.wait(lock, [&] { return queue_.empty() && running_ == 0; });
 }
 
+std::size_t OperationQueue::unfinishedCount() const {
+  std::lock_guard<std::mutex> guard(mutex_);
+  return queue_.size() + running_;
+}
+
 std::size_t OperationQueue::runningCount() const {
   std::lock_guard<std::mutex> guard(mutex_);
   return running_;

@@ -32,6 +32,8 @@ class OperationQueue {
   // Blocks until no operation is queued or running.
   void waitUntilAllOperationsAreFinished();
 
+  // How many operations are queued or running right now.
+  std::size_t unfinishedCount() const;
   // How many operations are running right now, and the most that ever ran at once.
   std::size_t runningCount() const;
   std::size_t peakRunningCount() const;

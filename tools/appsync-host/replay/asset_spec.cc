@@ -25,9 +25,9 @@ void setShownPath(plist::Dict& dict, std::string key, const std::optional<std::s
 }  // namespace
 
 std::shared_ptr<TRAsset> readAsset(const YamlField& field, const std::filesystem::path& root) {
-  field.allowOnly({"identifier", "dataclass", "prettyName", "path", "download", "restore",
-                   "completedParts", "storePID", "variantOptions", "infoPlist", "storePlist",
-                   "icon", "downloadProgress", "installProgress"});
+  field.allowOnly({"identifier", "dataclass", "prettyName", "path", "relativePath", "download",
+                   "restore", "completedParts", "storePID", "variantOptions", "infoPlist",
+                   "storePlist", "icon", "downloadProgress", "installProgress"});
   std::optional<std::string> prettyName;
   if (auto value = field.optional("prettyName")) prettyName = value->string();
   const auto dataclass = field.optional("dataclass");
@@ -37,6 +37,13 @@ std::shared_ptr<TRAsset> readAsset(const YamlField& field, const std::filesystem
       dataclass ? dataclass->string() : std::string(kApplicationDataclass), prettyName,
       download && download->boolean());
   asset->setPath(readPath(field, "path", root));
+  if (auto relative = field.optional("relativePath")) {
+    // The host's own form: a path relative to its public staging folder, handed over as written.
+    if (field.has("path")) relative->fail("an asset takes path or relativePath, not both");
+    const std::string text = relative->string();
+    if (text.starts_with('/')) relative->fail("a relative path does not begin with \"/\"");
+    asset->setPath(text);
+  }
   asset->setInfoPlist(readPath(field, "infoPlist", root));
   asset->setStorePlist(readPath(field, "storePlist", root));
   asset->setIcon(readPath(field, "icon", root));

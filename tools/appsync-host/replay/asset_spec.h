@@ -14,6 +14,8 @@ namespace appsync::host::replay {
 //   identifier (required), dataclass (default "Application"), prettyName,
 //   path, infoPlist, storePlist, icon   (device paths, resolved under the root and otherwise
 //                                         handed over as written: see clientPath),
+//   relativePath (instead of path: the host's path relative to its public staging folder,
+//                 handed over exactly as written),
 //   download, restore (booleans, default false), completedParts (unsigned), storePID (integer),
 //   variantOptions (a mapping, as a property list), downloadProgress, installProgress (numbers).
 // Throws InputError naming the field.

@@ -10,6 +10,7 @@
 #include "device_files.h"
 #include "platform/fake/fake_kc_coordinator.h"
 #include "platform/fake/fake_kc_history.h"
+#include "replay/install_progress_names.h"
 #include "replay/plist_difference.h"
 #include "runtime/fs/files.h"
 #include "runtime/plist/codec.h"
@@ -87,7 +88,8 @@ void checkFile(const YamlField& step) {
   if (auto contents = step.optional("plist")) contents->plist();
   if (auto format = step.optional("format")) {
     checkChoice(*format, {"binary", "xml"});
-    if (step.has("exists") && !step["exists"].boolean()) format->fail("a missing file has no format");
+    if (step.has("exists") && !step["exists"].boolean())
+      format->fail("a missing file has no format");
   }
 }
 
@@ -284,6 +286,64 @@ std::optional<std::string> evaluateRegistry(DeviceSession& session, const YamlFi
   return std::nullopt;
 }
 
+// --- progress ---
+
+constexpr std::string_view kProgressFields[] = {"state", "phase",     "completed",
+                                                "total", "cancelled", "phaseFinished"};
+
+void checkProgress(const YamlField& step) {
+  step["app"].string();
+  if (auto none = step.optional("none")) {
+    if (!none->boolean()) none->fail("write none: true, or leave the field out");
+    for (auto key : kProgressFields) {
+      if (auto field = step.optional(key)) field->fail("an install without progress has no fields");
+    }
+    return;
+  }
+  if (auto state = step.optional("state")) installCodeOf(*state, installStateNames());
+  if (auto phase = step.optional("phase")) installCodeOf(*phase, installPhaseNames());
+  for (auto key : {"completed", "total"}) {
+    if (auto field = step.optional(key)) field->integer();
+  }
+  for (auto key : {"cancelled", "phaseFinished"}) {
+    if (auto field = step.optional(key)) field->boolean();
+  }
+}
+
+std::optional<std::string> evaluateProgress(DeviceSession& session, const YamlField& step,
+                                            const ReplayOutput&) {
+  const std::string app = step["app"].string();
+  FakeARWorkspace& registry = session.device().ar();
+  const std::shared_ptr<ARInstallProgress> progress = registry.currentInstallProgress(app);
+  if (step.has("none")) {
+    if (!progress) return std::nullopt;
+    return app + ": expected no install progress, found " + progress->describe();
+  }
+  if (!progress) return app + ": expected install progress, found none";
+  const auto finished = registry.finishedPhases();
+  const bool phaseFinished =
+      std::find(finished.begin(), finished.end(), progress) != finished.end();
+  const auto nameOf = [](const std::vector<std::string>& names, std::uint64_t code) {
+    return code < names.size() ? names[code] : std::to_string(code);
+  };
+  const std::pair<std::string_view, plist::Value> found[] = {
+      {"state", plist::Value(nameOf(installStateNames(), progress->installState()))},
+      {"phase", plist::Value(nameOf(installPhaseNames(), progress->installPhase()))},
+      {"completed", plist::Value(progress->completedUnitCount())},
+      {"total", plist::Value(progress->totalUnitCount())},
+      {"cancelled", plist::Value(progress->isCancelled())},
+      {"phaseFinished", plist::Value(phaseFinished)},
+  };
+  for (const auto& [key, value] : found) {
+    auto expected = step.optional(key);
+    if (!expected) continue;
+    if (auto difference = firstDifference(expected->plist(), value, std::string(key))) {
+      return app + ": " + *difference;
+    }
+  }
+  return std::nullopt;
+}
+
 // --- homescreen ---
 
 void checkHomescreen(const YamlField& step) {
@@ -467,6 +527,10 @@ const std::vector<Kind>& kinds() {
         "hasMIDBasedSINF", "bundle", "container"},
        checkRegistry,
        evaluateRegistry},
+      {"progress",
+       {"app", "none", "state", "phase", "completed", "total", "cancelled", "phaseFinished"},
+       checkProgress,
+       evaluateProgress},
       {"homescreen", {"syncState", "iconLayout"}, checkHomescreen, evaluateHomescreen},
       {"transactions", {"entries", "since"}, checkTransactions, evaluateTransactions},
       {"coordinator",

@@ -1,5 +1,6 @@
 // The `expect:` steps of a replay: what the device, its log or its transaction log must show.
-// Kinds: file, log, todo, registry, homescreen, transactions, coordinator (docs/replay.md).
+// Kinds: file, log, todo, registry, progress, homescreen, transactions, coordinator
+// (docs/replay.md).
 #pragma once
 
 #include <optional>

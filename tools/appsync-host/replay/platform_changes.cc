@@ -12,6 +12,7 @@
 #include "platform/rs.h"
 #include "replay/action_table.h"
 #include "replay/actions.h"
+#include "replay/install_progress_names.h"
 #include "replay/scratch_directory.h"
 #include "runtime/plist/codec.h"
 
@@ -154,20 +155,9 @@ ActionResult removeApp(StepContext& s) {
 // The registry runs an install of an app it holds: the app's current install progress gets the
 // phase and the state named, so the registry reports it among its prioritized or paused installs.
 ActionResult installProgress(StepContext& s) {
-  static const std::vector<std::string> kStates = {"waiting",  "active", "paused",
-                                                   "canceled", "failed", "finished"};
-  static const std::vector<std::string> kPhases = {"loading", "installing", "restoring-data",
-                                                   "installing-placeholder"};
-  auto codeOf = [](const YamlField& field, const std::vector<std::string>& names) {
-    const std::string text = field.string();
-    for (std::size_t i = 0; i < names.size(); ++i) {
-      if (names[i] == text) return static_cast<std::uint64_t>(i);
-    }
-    field.fail("unknown value \"" + text + "\" (expected one of: " + joinNames(names) + ")");
-  };
   const std::string app = s.step["app"].string();
-  const std::uint64_t state = codeOf(s.step["state"], kStates);
-  const std::uint64_t phase = codeOf(s.step["phase"], kPhases);
+  const std::uint64_t state = installCodeOf(s.step["state"], installStateNames());
+  const std::uint64_t phase = installCodeOf(s.step["phase"], installPhaseNames());
   std::shared_ptr<ARInstallProgress> progress = s.session.device().ar().installProgress(app, phase);
   if (!progress) throw StepFailed("the registry holds no application " + app);
   progress->setInstallState(state);
