@@ -13,22 +13,16 @@
 #include "platform/fake/fake_platform.h"
 #include "runtime/fs/files.h"
 #include "support/temp_dir.h"
+#include "transfer/install_fixture.h"
 
 namespace appsync {
 namespace {
 
 namespace fs = std::filesystem;
+using testing::makeAsset;
 using testing::TempDir;
-
-// A delivered bundle folder for `identifier` under ROOT/staging; its path.
-std::string writePackage(const fs::path& root, const std::string& identifier) {
-  const std::string bundle = (root / "staging" / (identifier + ".app")).string();
-  EXPECT_TRUE(createDirectories(bundle));
-  EXPECT_TRUE(writePlistAtomically(bundle + "/Info.plist",
-                                   plist::Dict{{"BNBundleIdentifier", identifier}},
-                                   plist::Format::Binary));
-  return bundle;
-}
+using testing::writePackage;
+using testing::writeTodoList;
 
 std::string writeBadPackage(const fs::path& root, const std::string& identifier) {
   const std::string archive = (root / "staging" / (identifier + ".zip")).string();
@@ -36,23 +30,6 @@ std::string writeBadPackage(const fs::path& root, const std::string& identifier)
   const plist::Bytes garbage{'n', 'o', 't', ' ', 'z', 'i', 'p'};
   EXPECT_TRUE(writeFileAtomically(archive, garbage));
   return archive;
-}
-
-void writeTodoList(FakePlatform& device, const std::vector<std::string>& identifiers) {
-  plist::Array records;
-  for (const auto& id : identifiers) {
-    records.emplace_back(plist::Dict{{"identifier", id}, {"operation", "install"}});
-  }
-  ASSERT_TRUE(createDirectories(device.paths().syncFolder()));
-  ASSERT_TRUE(writePlistAtomically(device.paths().todoList(), records, plist::Format::Binary));
-}
-
-std::shared_ptr<TRAsset> makeAsset(const std::string& identifier, const std::string& path,
-                                   bool restore = false) {
-  auto asset = TRAsset::downloadAssetWithIdentifier(identifier, "Application", std::nullopt);
-  asset->setPath(path);
-  asset->setIsRestore(restore);
-  return asset;
 }
 
 std::vector<std::string> scenarioDescriptions(FakePlatform& device) {
