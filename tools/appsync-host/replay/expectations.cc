@@ -162,11 +162,13 @@ std::optional<std::string> evaluateLog(DeviceSession& session, const YamlField& 
   };
   const auto found = std::ranges::find_if(lines, matches);
   const bool present = !step.has("present") || step["present"].boolean();
-  const std::string what = std::string(exact ? "the log line " : "a log line containing ") +
+  const std::string what = std::string(exact ? "log line " : "log line containing ") +
                            inQuotes(text) + (sinceStep(step) ? " in the last step" : "");
-  if (present && found == lines.end()) return "expected " + what + ", found none";
+  if (present && found == lines.end()) {
+    return std::string("expected ") + (exact ? "the " : "a ") + what + ", found none";
+  }
   if (!present && found != lines.end()) {
-    return "expected no " + what.substr(4) + ", found " + inQuotes(found->message);
+    return "expected no " + what + ", found " + inQuotes(found->message);
   }
   return std::nullopt;
 }
