@@ -225,6 +225,38 @@ class AppsClient : public TRClient,
       const std::optional<plist::Bytes>& sinfData, const std::optional<plist::Bytes>& iconData,
       std::uint64_t demotionStatus);
 
+  // ---- Coordinated restore (coordination/coordinated_restore.cc) ------------------------------
+  // A restoring coordinator with a complete user-data promise and a restore placeholder; the
+  // store daemon downloads the package (not for a demoted app). True when the service has all
+  // the client has to give. A failure cancels with TRError 29 and releases the app's count.
+  bool prepareAppForRestoreUsingCoordination(const std::string& bundleID,
+                                             const plist::Bytes& caravelMetadata,
+                                             const std::optional<plist::Bytes>& sinfData,
+                                             const std::optional<plist::Bytes>& iconData,
+                                             std::uint64_t demotionStatus);
+  bool _prepareDemotedAppForRestoreWithBundleId(const std::string& bundleID,
+                                                const plist::Bytes& caravelMetadata,
+                                                const std::optional<plist::Bytes>& sinfData,
+                                                const std::optional<plist::Bytes>& iconData,
+                                                std::uint64_t demotionStatus);
+  bool _prepareNonDemotedAppForRestoreWithBundleId(const std::string& bundleID,
+                                                   const plist::Bytes& caravelMetadata,
+                                                   const std::optional<plist::Bytes>& sinfData,
+                                                   const std::optional<plist::Bytes>& iconData);
+
+  // ---- Restore placeholder wait (coordination/restore_wait.cc) --------------------------------
+  // Each runs one synchronous work item on _restoreQueue; never call them from that queue.
+  //
+  // A placeholder promise is (about to be) handed to a restoring coordinator: the app is counted
+  // until its placeholder is installed or its coordinator cancelled. Counted once.
+  void dataMigratorSetPlaceHolderPromiseForRestoreAppBundle(const std::string& bundleID);
+  // The service installed the app's placeholder: releases its count, unless the wait is over.
+  void icDidInstallPlaceHolderForAppBundle(const std::string& bundleID);
+  // The app's restore failed: releases its count, if it has one, wait or no wait.
+  void dataMigratorCancelledCoordinatorForRestoreAppBundle(const std::string& bundleID);
+  // The number of apps counted now.
+  std::int64_t restoringPlaceholderCount();
+
   // ---- Coordinated sync install (coordination/coordinated_install.cc) -------------------------
   // Readies a coordinator for a package the host is about to send: install options, SPR
   // promises, an asset promise without a path and a placeholder. False means the package must
