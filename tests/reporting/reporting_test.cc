@@ -68,32 +68,27 @@ TEST(ReportingTest, BackupPreparationRewritesOnlyWhatItMarksChanged) {
   struct Case {
     const char* name;
     plist::Dict before;
-    bool deviceBased;
     std::optional<plist::Dict> after;  // absent: the file is not touched
     std::vector<std::string> lines;
     bool sameBytesLeftAlone = false;  // the rewrite would give the file's own bytes
   };
   // A flag set or changed is shown by the reporting scenario.
+  // clang-format off
   const std::vector<Case> cases = {
-      {"no entry, flag false, no auto-download", {{"k", 1}}, false, std::nullopt, {}},
-      {"auto-download false is kept", {{"is-auto-download", false}}, false, std::nullopt, {}},
-      {"entry already equal: updated, and the file already holds it",
-       {{"DeviceBasedBLK", false}},
-       false,
+      {"no entry, flag false, no auto-download", {{"k", 1}}, std::nullopt, {}},
+      {"auto-download false is kept", {{"is-auto-download", false}}, std::nullopt, {}},
+      {"entry already equal: updated, and the file already holds it", {{"DeviceBasedBLK", false}},
        plist::Dict{{"DeviceBasedBLK", false}},
-       {pluginLine("Updated DeviceBasedBLK state for : app to 0")},
-       true},
-      {"auto-download true is removed",
-       {{"is-auto-download", true}, {"k", 1}},
-       false,
-       plist::Dict{{"k", 1}},
-       {pluginLine("clearing is-auto-download value for app")}},
+       {pluginLine("Updated DeviceBasedBLK state for : app to 0")}, true},
+      {"auto-download true is removed", {{"is-auto-download", true}, {"k", 1}},
+       plist::Dict{{"k", 1}}, {pluginLine("clearing is-auto-download value for app")}},
   };
+  // clang-format on
   for (const plist::Format format : {plist::Format::Binary, plist::Format::Xml}) {
     for (const Case& c : cases) {
       SCOPED_TRACE(std::string(c.name) + (format == plist::Format::Xml ? " (XML)" : " (binary)"));
       Device d;
-      d.addWithMetadata("app", c.before, format, c.deviceBased);
+      d.addWithMetadata("app", c.before, format);
       const std::string path = d.metadataPath("app");
       const plist::Bytes bytesBefore = readFile(path).value();
       const FileIdentity identityBefore = fileIdentity(path).value();
