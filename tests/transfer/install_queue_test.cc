@@ -1,5 +1,5 @@
 // The legacy install queue where the stress test and the scenarios do not look: the transactions
-// of rarer endings, error classification, the concurrency limit and teardown.
+// of rarer endings, an unknown app's progress, the concurrency limit and teardown.
 #include <gtest/gtest.h>
 
 #include <condition_variable>
@@ -86,21 +86,13 @@ TEST(InstallQueue, EndingsTheScenariosDoNotReachLogTheirTransactions) {
   }
 }
 
-TEST(InstallQueue, ClassifiesErrorsAndReportsProgressOnlyOnTheLegacyRoad) {
-  for (bool coordination : {false, true}) {
-    SCOPED_TRACE(coordination ? "coordinated" : "legacy");
-    TempDir root;
-    FakePlatform device(root.path(), {.coordination = coordination});
-    device.ar().putApplication({.identifier = "com.example.app", .isPlaceholder = true});
-    AppsClient client(device.platform());
-    EXPECT_FALSE(client._isRecoverableError(makeError(kTRErrorDomain, 5)));
-    device.tr().setRecoverableErrorPredicate([](const ErrorRef&) { return true; });
-    EXPECT_EQ(client._isRecoverableError(makeError(kTRErrorDomain, 5)), !coordination);
-    EXPECT_FALSE(client._isRecoverableError(makeError(kEMInstallerErrorDomain, 5)));
-    EXPECT_FALSE(client._isRecoverableError(makeError(kAppRegistryErrorDomain, 5)));
-    EXPECT_EQ(client._progressForAssetIdentifier("com.example.app") != nullptr, !coordination);
-    EXPECT_EQ(client._progressForAssetIdentifier("com.example.unknown"), nullptr);
-  }
+// The stress test classifies errors on the legacy road and sync-installs-coordinated shows that
+// none is recoverable on the coordinated one; an app the registry does not know has no progress.
+TEST(InstallQueue, NoProgressForAnAppTheRegistryDoesNotKnow) {
+  TempDir root;
+  FakePlatform device(root.path());
+  AppsClient client(device.platform());
+  EXPECT_EQ(client._progressForAssetIdentifier("com.example.unknown"), nullptr);
 }
 
 // Holds every package install until `release`, counting how many run at once.
