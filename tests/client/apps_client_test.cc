@@ -30,10 +30,9 @@ struct AppsClientTestAccess {
 
 namespace {
 
-FakePlatform::Options insideHostDaemon(bool coordination = true) {
-  FakePlatform::Options options;
-  options.mainBundleIdentifier = "com.vantor.trc";
-  options.coordination = coordination;
+FakePlatform::Options insideHostDaemon(bool coordination = true, bool host = true) {
+  FakePlatform::Options options{.coordination = coordination};
+  if (host) options.mainBundleIdentifier = "com.vantor.trc";
   return options;
 }
 
@@ -77,12 +76,7 @@ TEST(AppsClientTest, ServicesSeeAWholeClientWhenItRegisters) {
     for (bool host : {false, true}) {
       SCOPED_TRACE(::testing::Message() << "coordination " << coordination << " host " << host);
       testing::TempDir root;
-      FakePlatform device(
-          root.path(), host ? insideHostDaemon(coordination) : [&] {
-            FakePlatform::Options options;
-            options.coordination = coordination;
-            return options;
-          }());
+      FakePlatform device(root.path(), insideHostDaemon(coordination, host));
       WatchedRegistry registry(device.ar());
       WatchedSystem system(device.system());
       {

@@ -65,16 +65,6 @@ TEST(RestorePlaceholderTest, BuildsAndInstallsThePlaceholder) {
                            {std::string(ARCaravelMetadataKey), metadataBytes},
                            {std::string(ARApplicationSINFKey),
                             c.withSinf ? plist::Value(kSinf) : plist::Value::null()}}));
-    // The registry lists it, and keeps the metadata in the application's container.
-    auto record = d.device.ar().application(kID);
-    ASSERT_TRUE(record);
-    EXPECT_TRUE(record->isPlaceholder);
-    EXPECT_EQ(record->installType, 2u);
-    EXPECT_EQ(record->name, c.expectedName);
-    EXPECT_EQ(record->iconPath, c.withIcon ? std::optional(icon) : std::nullopt);
-    EXPECT_EQ(readFile(d.root / ("private/var/containers/Bundle/Application/" + kID +
-                                 "/CaravelMetadata.plist")),
-              metadataBytes);
     EXPECT_EQ(d.scenarios(), std::vector<std::string>{
                                  "Caravel App Restore yes com.example.app: Installed placeholder"});
     // Owner and group: the directory, the parent it made, the icon.
