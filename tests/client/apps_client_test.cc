@@ -5,6 +5,8 @@
 #include <gtest/gtest.h>
 
 #include <atomic>
+#include <functional>
+#include <map>
 #include <set>
 #include <thread>
 #include <vector>
@@ -28,10 +30,9 @@ struct AppsClientTestAccess {
 
 namespace {
 
-FakePlatform::Options insideHostDaemon(bool coordination = true) {
-  FakePlatform::Options options;
-  options.mainBundleIdentifier = "com.vantor.trc";
-  options.coordination = coordination;
+FakePlatform::Options insideHostDaemon(bool coordination = true, bool host = true) {
+  FakePlatform::Options options{.coordination = coordination};
+  if (host) options.mainBundleIdentifier = "com.vantor.trc";
   return options;
 }
 
@@ -75,17 +76,13 @@ TEST(AppsClientTest, ServicesSeeAWholeClientWhenItRegisters) {
     for (bool host : {false, true}) {
       SCOPED_TRACE(::testing::Message() << "coordination " << coordination << " host " << host);
       testing::TempDir root;
-      FakePlatform device(
-          root.path(), host ? insideHostDaemon(coordination) : [&] {
-            FakePlatform::Options options;
-            options.coordination = coordination;
-            return options;
-          }());
+      FakePlatform device(root.path(), insideHostDaemon(coordination, host));
       WatchedRegistry registry(device.ar());
       WatchedSystem system(device.system());
       {
         AppsClient client(device.platform().with(registry).with(system));
         EXPECT_EQ(client.useInstallCoordinator(), coordination);
+        EXPECT_FALSE(client.hasInstallCoordinatorObserver());  // not before the start-up
         EXPECT_EQ(device.ar().observerCount(), 1u);
         EXPECT_EQ(device.system().notificationObserverCount(), host ? 1u : 0u);
         auto logs = device.transactionLog().initializeCalls();
@@ -151,9 +148,15 @@ TEST(AppsClientTest, TheObserverIsCreatedAndDroppedWithoutHoldingTheClient) {
   {
     AppsClient client(device.platform().with(coordination));
     coordination.client = &client;
-    device.system().postNotification("com.vantor.trc.TRStartupCompleteNotification");
+    AppsClient::_handleTRCStartupCompletedNotification(nullptr, nullptr, "", nullptr, nullptr);
+    device.system().postNotification("com.vantor.trc.SomethingElse");
+    EXPECT_FALSE(client.hasInstallCoordinatorObserver());
+    for (int post = 0; post < 2; ++post) {
+      device.system().postNotification("com.vantor.trc.TRStartupCompleteNotification");
+    }
     EXPECT_FALSE(coordination.askedDuringCreation);
     EXPECT_TRUE(client.hasInstallCoordinatorObserver());
+    EXPECT_EQ(device.kc().callCount("initWithMachServiceName:forClients:delegate:"), 1u);
   }  // dropping the observer asks again
   EXPECT_EQ(coordination.serviceName, "com.vantor.trc.zpc.icappobserverdelegate");
   EXPECT_EQ(coordination.clientNumbers, std::set<std::uint64_t>{3});
@@ -215,42 +218,6 @@ TEST(AppsClientTest, TeardownReportsUnfinishedWorkAtErrorLevel) {
   EXPECT_TRUE(device.log().lines().empty());
 }
 
-TEST(AppsClientTest, OutsideTheHostDaemonNoStartupHandshakeHappens) {
-  testing::TempDir root;
-  FakePlatform device(root.path());
-  AppsClient client(device.platform());
-  device.system().postNotification("com.vantor.trc.TRStartupCompleteNotification");
-  EXPECT_FALSE(client.hasInstallCoordinatorObserver());
-  EXPECT_EQ(device.kc().callCount("initWithMachServiceName:forClients:delegate:"), 0u);
-}
-
-TEST(AppsClientTest, InsideTheHostDaemonStartupCreatesTheObserverOnce) {
-  testing::TempDir root;
-  FakePlatform device(root.path(), insideHostDaemon());
-  AppsClient client(device.platform());
-  EXPECT_FALSE(client.hasInstallCoordinatorObserver());
-
-  device.system().postNotification("com.vantor.trc.TRStartupCompleteNotification");
-  EXPECT_TRUE(client.hasInstallCoordinatorObserver());
-  device.system().postNotification("com.vantor.trc.TRStartupCompleteNotification");
-  EXPECT_EQ(device.kc().callCount("initWithMachServiceName:forClients:delegate:"), 1u);
-
-  // Other notifications are not the start-up notification.
-  device.system().postNotification("com.vantor.trc.SomethingElse");
-  EXPECT_EQ(device.kc().callCount("initWithMachServiceName:forClients:delegate:"), 1u);
-}
-
-TEST(AppsClientTest, StartupCallbackWithoutObserverDoesNothing) {
-  testing::TempDir root;
-  FakePlatform device(root.path(), insideHostDaemon());
-  AppsClient client(device.platform());
-  AppsClient::_handleTRCStartupCompletedNotification(
-      nullptr, nullptr, "com.vantor.trc.TRStartupCompleteNotification", nullptr, nullptr);
-  EXPECT_FALSE(client.hasInstallCoordinatorObserver());
-  AppsClient::_handleTRCStartupCompletedNotification(nullptr, &client, "", nullptr, nullptr);
-  EXPECT_TRUE(client.hasInstallCoordinatorObserver());
-}
-
 TEST(AppsClientTest, RestrictionsAllowUnlessExplicitlyForbidden) {
   testing::TempDir root;
   FakePlatform device(root.path());
@@ -268,11 +235,6 @@ TEST(AppsClientTest, InstallAttemptCounterLosesNoIncrement) {
   testing::TempDir root;
   FakePlatform device(root.path());
   AppsClient client(device.platform());
-  client._countAppInstallAttempt();
-  client._countAppInstallAttempt();
-  EXPECT_EQ(client._getAndResetNumAppInstallsAttempted(), 2u);
-  EXPECT_EQ(client._getAndResetNumAppInstallsAttempted(), 0u);
-
   constexpr int kThreads = 4, kPerThread = 20000;
   std::atomic<bool> done{false};
   std::uint64_t collected = 0;
@@ -292,127 +254,50 @@ TEST(AppsClientTest, InstallAttemptCounterLosesNoIncrement) {
   EXPECT_EQ(collected, static_cast<std::uint64_t>(kThreads * kPerThread));
 }
 
-// Calls one optional operation with throwaway arguments.
-void call(AppsClient& c, TRClientOperation operation) {
-  using Op = TRClientOperation;
-  auto asset = TRAsset::downloadAssetWithIdentifier("com.a", "Application", "A");
-  std::vector<std::string> paths;
-  switch (operation) {
-    case Op::currentSyncAnchor:
-      c.currentSyncAnchor();
-      return;
-    case Op::prepareForSyncWithHostAnchor:
-      c.prepareForSyncWithHostAnchor("a", nullptr, nullptr);
-      return;
-    case Op::prepareForSyncWithHostAnchorHostAuthIdentifierHostVersion:
-      c.prepareForSyncWithHostAnchor("a", 1, "v", nullptr, nullptr);
-      return;
-    case Op::reconcileSync:
-      c.reconcileSync(0, "a", nullptr, nullptr);
-      return;
-    case Op::syncEndedWithSuccess:
-      c.syncEndedWithSuccess(false);
-      return;
-    case Op::reconcileRestoreOfType:
-      c.reconcileRestoreOfType(0, nullptr);
-      return;
-    case Op::reconcileRestoreWithError:
-      c.reconcileRestoreWithError(nullptr);
-      return;
-    case Op::restoreEndedWithError:
-      c.restoreEndedWithError(nullptr);
-      return;
-    case Op::cancelSyncOperations:
-      c.cancelSyncOperations();
-      return;
-    case Op::registerMessageHandlersWithLink:
-      c.registerMessageHandlersWithLink(nullptr);
-      return;
-    case Op::installedAssets:
-      c.installedAssets();
-      return;
-    case Op::outstandingAssetTransfers:
-      c.outstandingAssetTransfers();
-      return;
-    case Op::outstandingAssetTransfersWithDownloadManager:
-      c.outstandingAssetTransfersWithDownloadManager(nullptr);
-      return;
-    case Op::assetTransferSucceeded:
-      c.assetTransfer(asset, false, nullptr);
-      return;
-    case Op::assetTransferUpdatedProgress:
-      c.assetTransfer(asset, 0.5);
-      return;
-    case Op::assetTransferEndedWithSuccess:
-      c.assetTransferEndedWithSuccess(false);
-      return;
-    case Op::assetInstallSucceeded:
-      c.assetInstallSucceeded(asset);
-      return;
-    case Op::assetInstallFailed:
-      c.assetInstallFailed(asset, nullptr);
-      return;
-    case Op::metadataUpdate:
-      c.metadataUpdate({}, asset, "a");
-      return;
-    case Op::prioritizeAsset:
-      c.prioritizeAsset(asset);
-      return;
-    case Op::initiateAssetDownloadsWithCompletion:
-      c.initiateAssetDownloadsWithCompletion(nullptr);
-      return;
-    case Op::clearSyncData:
-      c.clearSyncData();
-      return;
-    case Op::installedAssetMetrics:
-      c.installedAssetMetrics();
-      return;
-    case Op::vantorIDsForAssets:
-      c.vantorIDsForAssets();
-      return;
-    case Op::accountsForAssets:
-      c.accountsForAssets();
-      return;
-    case Op::disabledAssetTypes:
-      c.disabledAssetTypes();
-      return;
-    case Op::prepareForBackup:
-      c.prepareForBackup();
-      return;
-    case Op::backupEnded:
-      c.backupEnded();
-      return;
-    case Op::pathsToBackup:
-      c.pathsToBackup(&paths, &paths);
-      return;
-    case Op::shouldRestoreFile:
-      c.shouldRestoreFile("/x", nullptr);
-      return;
-    case Op::shouldBackgroundRestorePath:
-      c.shouldBackgroundRestorePath("/x", nullptr);
-      return;
-    case Op::shouldBackgroundRestoreFile:
-      c.shouldBackgroundRestoreFile("/x", nullptr);
-      return;
-  }
-}
-
-TEST(AppsClientDeathTest, RespondsToExactlyTheOperationsItImplements) {
-  // An operation the client does not claim must abort with its name when called anyway; one it
-  // claims must not. Adding an operation without claiming it, or the other way round, fails.
+TEST(AppsClientDeathTest, TheOperationsItDoesNotClaimAbortWithTheirName) {
+  // The scenarios call every operation the client claims. One it does not claim must abort
+  // when called anyway: implementing an operation without claiming it fails here.
   GTEST_FLAG_SET(death_test_style, "threadsafe");
   testing::TempDir root;
   FakePlatform device(root.path());
   AppsClient client(device.platform());
-  for (int i = 0; i <= static_cast<int>(TRClientOperation::shouldBackgroundRestoreFile); ++i) {
-    const auto operation = static_cast<TRClientOperation>(i);
+  using Op = TRClientOperation;
+  auto asset = TRAsset::downloadAssetWithIdentifier("com.a", "Application", "A");
+  std::vector<std::string> paths;
+  const std::map<Op, std::function<void(AppsClient&)>> unclaimed = {
+      {Op::currentSyncAnchor, [](AppsClient& c) { c.currentSyncAnchor(); }},
+      {Op::prepareForSyncWithHostAnchor,
+       [](AppsClient& c) { c.prepareForSyncWithHostAnchor("a", nullptr, nullptr); }},
+      {Op::prepareForSyncWithHostAnchorHostAuthIdentifierHostVersion,
+       [](AppsClient& c) { c.prepareForSyncWithHostAnchor("a", 1, "v", nullptr, nullptr); }},
+      {Op::reconcileRestoreOfType, [](AppsClient& c) { c.reconcileRestoreOfType(0, nullptr); }},
+      {Op::reconcileRestoreWithError, [](AppsClient& c) { c.reconcileRestoreWithError(nullptr); }},
+      {Op::restoreEndedWithError, [](AppsClient& c) { c.restoreEndedWithError(nullptr); }},
+      {Op::cancelSyncOperations, [](AppsClient& c) { c.cancelSyncOperations(); }},
+      {Op::registerMessageHandlersWithLink,
+       [](AppsClient& c) { c.registerMessageHandlersWithLink(nullptr); }},
+      {Op::outstandingAssetTransfersWithDownloadManager,
+       [](AppsClient& c) { c.outstandingAssetTransfersWithDownloadManager(nullptr); }},
+      {Op::metadataUpdate, [&](AppsClient& c) { c.metadataUpdate({}, asset, "a"); }},
+      {Op::prioritizeAsset, [&](AppsClient& c) { c.prioritizeAsset(asset); }},
+      {Op::initiateAssetDownloadsWithCompletion,
+       [](AppsClient& c) { c.initiateAssetDownloadsWithCompletion(nullptr); }},
+      {Op::backupEnded, [](AppsClient& c) { c.backupEnded(); }},
+      {Op::pathsToBackup, [&](AppsClient& c) { c.pathsToBackup(&paths, &paths); }},
+      {Op::shouldRestoreFile, [](AppsClient& c) { c.shouldRestoreFile("/x", nullptr); }},
+      {Op::shouldBackgroundRestorePath,
+       [](AppsClient& c) { c.shouldBackgroundRestorePath("/x", nullptr); }},
+      {Op::shouldBackgroundRestoreFile,
+       [](AppsClient& c) { c.shouldBackgroundRestoreFile("/x", nullptr); }},
+  };
+  for (int i = 0; i <= static_cast<int>(Op::shouldBackgroundRestoreFile); ++i) {
+    const auto operation = static_cast<Op>(i);
     SCOPED_TRACE(operationName(operation));
-    if (client.respondsTo(operation)) {
-      call(client, operation);
-    } else {
-      EXPECT_DEATH(call(client, operation),
-                   std::string(operationName(operation)) + " is not implemented by this client");
-    }
+    const auto call = unclaimed.find(operation);
+    EXPECT_EQ(call == unclaimed.end(), client.respondsTo(operation));
+    if (call == unclaimed.end()) continue;
+    EXPECT_DEATH(call->second(client),
+                 std::string(operationName(operation)) + " is not implemented by this client");
   }
 }
 

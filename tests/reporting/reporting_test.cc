@@ -13,6 +13,7 @@
 #include "runtime/fs/files.h"
 #include "runtime/plist/codec.h"
 #include "support/temp_dir.h"
+#include "support/text_file.h"
 
 namespace appsync::reporting_test {
 namespace {
@@ -68,32 +69,27 @@ TEST(ReportingTest, BackupPreparationRewritesOnlyWhatItMarksChanged) {
   struct Case {
     const char* name;
     plist::Dict before;
-    bool deviceBased;
     std::optional<plist::Dict> after;  // absent: the file is not touched
     std::vector<std::string> lines;
     bool sameBytesLeftAlone = false;  // the rewrite would give the file's own bytes
   };
   // A flag set or changed is shown by the reporting scenario.
+  // clang-format off
   const std::vector<Case> cases = {
-      {"no entry, flag false, no auto-download", {{"k", 1}}, false, std::nullopt, {}},
-      {"auto-download false is kept", {{"is-auto-download", false}}, false, std::nullopt, {}},
-      {"entry already equal: updated, and the file already holds it",
-       {{"DeviceBasedBLK", false}},
-       false,
+      {"no entry, flag false, no auto-download", {{"k", 1}}, std::nullopt, {}},
+      {"auto-download false is kept", {{"is-auto-download", false}}, std::nullopt, {}},
+      {"entry already equal: updated, and the file already holds it", {{"DeviceBasedBLK", false}},
        plist::Dict{{"DeviceBasedBLK", false}},
-       {pluginLine("Updated DeviceBasedBLK state for : app to 0")},
-       true},
-      {"auto-download true is removed",
-       {{"is-auto-download", true}, {"k", 1}},
-       false,
-       plist::Dict{{"k", 1}},
-       {pluginLine("clearing is-auto-download value for app")}},
+       {pluginLine("Updated DeviceBasedBLK state for : app to 0")}, true},
+      {"auto-download true is removed", {{"is-auto-download", true}, {"k", 1}},
+       plist::Dict{{"k", 1}}, {pluginLine("clearing is-auto-download value for app")}},
   };
+  // clang-format on
   for (const plist::Format format : {plist::Format::Binary, plist::Format::Xml}) {
     for (const Case& c : cases) {
       SCOPED_TRACE(std::string(c.name) + (format == plist::Format::Xml ? " (XML)" : " (binary)"));
       Device d;
-      d.addWithMetadata("app", c.before, format, c.deviceBased);
+      d.addWithMetadata("app", c.before, format);
       const std::string path = d.metadataPath("app");
       const plist::Bytes bytesBefore = readFile(path).value();
       const FileIdentity identityBefore = fileIdentity(path).value();
@@ -133,39 +129,32 @@ TEST(ReportingTest, HostileMetadataNeitherStopsAWalkNorEscapesTheRoot) {
 
   struct Case {
     const char* name;
-    std::function<void(Device&, const std::string& container)> make;
+    std::function<void(const std::string& file)> make;  // the hostile app's metadata file
   };
   const std::vector<Case> cases = {
       {"root is an array",
-       [](Device& d, const std::string&) {
-         writePlistAtomically(d.metadataPath("hostile"), plist::Array{plist::Value(true)},
-                              plist::Format::Binary);
+       [](const std::string& file) {
+         writePlistAtomically(file, plist::Array{plist::Value(true)}, plist::Format::Binary);
        }},
       {"nesting deeper than the reader allows",
-       [&](Device& d, const std::string&) {
-         const std::string text = "<plist>" + deep + "</plist>";
-         writeFileAtomically(d.metadataPath("hostile"),
-                             {reinterpret_cast<const std::uint8_t*>(text.data()), text.size()});
-       }},
+       [&](const std::string& file) { testing::writeText(file, "<plist>" + deep + "</plist>"); }},
       {"a huge string",
-       [&](Device& d, const std::string&) {
-         writePlistAtomically(d.metadataPath("hostile"),
-                              plist::Dict{{"vantorId", huge}, {"is-auto-download", true}},
+       [&](const std::string& file) {
+         writePlistAtomically(file, plist::Dict{{"vantorId", huge}, {"is-auto-download", true}},
                               plist::Format::Binary);
        }},
       {"a link to a file outside the root",
-       [&](Device& d, const std::string&) {
-         fs::create_symlink(outsideFile, d.metadataPath("hostile"));
-       }},
+       [&](const std::string& file) { fs::create_symlink(outsideFile, file); }},
       {"a container that leads outside the root",
-       [&](Device&, const std::string& container) {
+       [&](const std::string& file) {
+         const fs::path container = fs::path(file).parent_path();
          fs::remove_all(container);
          fs::create_directory_symlink(outside.path(), container);
        }},
       {"a directory where the file belongs",
-       [](Device& d, const std::string&) { fs::create_directory(d.metadataPath("hostile")); }},
+       [](const std::string& file) { fs::create_directory(file); }},
       {"a pipe where the file belongs",
-       [](Device& d, const std::string&) { ::mkfifo(d.metadataPath("hostile").c_str(), 0644); }},
+       [](const std::string& file) { ::mkfifo(file.c_str(), 0644); }},
   };
   for (const Case& c : cases) {
     SCOPED_TRACE(c.name);
@@ -174,7 +163,7 @@ TEST(ReportingTest, HostileMetadataNeitherStopsAWalkNorEscapesTheRoot) {
     Device d;
     d.addWithMetadata("a-first", plist::Dict{{"vantorId", "first@x"}, {"is-auto-download", true}});
     d.add({.identifier = "hostile", .hasMIDBasedSINF = true});
-    c.make(d, d.container("hostile"));
+    c.make(d.metadataPath("hostile"));
     d.addWithMetadata("z-last", accountInfo({{"VantorID", "last@x"}}), plist::Format::Binary, true);
     AppsClient client(d.platform.platform());
 

@@ -76,39 +76,33 @@ TEST(PlaceholderLookupTest, CoordinatedRoadAnswersNoWithoutAsking) {
   EXPECT_TRUE(testing::linesStartingWith(device.log(), pluginLine("Found")).empty());
 }
 
+// The scenarios skip a system placeholder; here is what else the registry holds.
 TEST(PlaceholderLookupTest, EnumerationVisitsOnlyApplicationPlaceholders) {
   PlaceholderDevice d;
+  EXPECT_TRUE(d.client._getSystemAppPlaceholders().empty());
+  EXPECT_EQ(d.device.log().count(pluginLine("SystemAppPlaceholders ()")), 1u);
   FakeARWorkspace& ar = d.device.ar();
   ar.putApplication({.identifier = "bundle", .isPlaceholder = true, .isApplication = false});
   ar.putApplication({.identifier = "installed"});
+  ar.putApplication({.identifier = "installed.sys", .applicationType = "System"});
+  ar.putApplication({.identifier = "a.sys", .applicationType = "System", .isPlaceholder = true});
   ar.putApplication({.identifier = "p1", .isPlaceholder = true});
-  ar.putApplication({.identifier = "sys", .applicationType = "System", .isPlaceholder = true});
+  ar.putApplication({.identifier = "z.sys", .applicationType = "System", .isPlaceholder = true});
 
   std::vector<std::string> seen;
   d.client._enumeratePlaceholdersWithBlock([&](const auto& proxy, bool*) {
     ASSERT_TRUE(proxy);
     seen.push_back(proxy->applicationIdentifier);
   });
-  EXPECT_EQ(seen, (std::vector<std::string>{"p1", "sys"}));
+  EXPECT_EQ(seen, (std::vector<std::string>{"a.sys", "p1", "z.sys"}));
 
   seen.clear();
   d.client._enumeratePlaceholdersWithBlock([&](const auto& proxy, bool* stop) {
     seen.push_back(proxy->bundleIdentifier);
     *stop = true;
   });
-  EXPECT_EQ(seen, std::vector<std::string>{"p1"});
-}
+  EXPECT_EQ(seen, std::vector<std::string>{"a.sys"});
 
-TEST(PlaceholderLookupTest, SystemPlaceholdersAreCollectedAndLogged) {
-  PlaceholderDevice d;
-  EXPECT_TRUE(d.client._getSystemAppPlaceholders().empty());
-  EXPECT_EQ(d.device.log().count(pluginLine("SystemAppPlaceholders ()")), 1u);
-
-  FakeARWorkspace& ar = d.device.ar();
-  ar.putApplication({.identifier = "z.sys", .applicationType = "System", .isPlaceholder = true});
-  ar.putApplication({.identifier = "a.sys", .applicationType = "System", .isPlaceholder = true});
-  ar.putApplication({.identifier = "installed.sys", .applicationType = "System"});
-  ar.putApplication({.identifier = "user", .isPlaceholder = true});
   EXPECT_EQ(d.client._getSystemAppPlaceholders(), (std::set<std::string>{"a.sys", "z.sys"}));
   EXPECT_EQ(d.device.log().count(pluginLine("SystemAppPlaceholders (a.sys, z.sys)")), 1u);
 }

@@ -1,4 +1,6 @@
 // The sync road: a placeholder for an announced asset, from its name, version, info and icon.
+// The outstanding-transfers scenarios show the registry's record and the icon; here are the
+// info keys, the options, the messages and what stops it.
 #include <gtest/gtest.h>
 
 #include "restore/placeholder_fixture.h"
@@ -44,20 +46,14 @@ TEST(SyncPlaceholderTest, InstallsWithTheThreeSyncOptions) {
                                 {"BNBundleIconFile", "Icon.png"},
                                 {"UIGazetteApp", true},
                                 {"ARApplicationLaunchProhibited", true}}));
-  EXPECT_EQ(readFile(dir + "/Icon.png"), kIcon);
-
   auto calls = d.device.ar().installCalls();
   ASSERT_EQ(calls.size(), 1u);
-  EXPECT_EQ(calls[0].path, dir);
   EXPECT_EQ(calls[0].options, (plist::Dict{{"PackageType", "Placeholder"},
                                            {"BNBundleIdentifier", "com.example.sync"},
                                            {"ARInstallType", 4u}}));
-  EXPECT_EQ(d.device.ar().application("com.example.sync")->installType, 4u);
-
   EXPECT_EQ(d.scenarios(), std::vector<std::string>{
                                "Install placeholder yes com.example.sync: Installed placeholder"});
   const MemoryLogSink& log = d.device.log();
-  EXPECT_TRUE(log.contains(pluginLine("plist " + *asset->infoPlist())));
   EXPECT_TRUE(log.contains(pluginLine("creating placeholder for 'com.example.sync'. info.plist=" +
                                       plist::Value(*info).describe())));
   EXPECT_TRUE(log.contains(pluginLine("Installed Placeholder app from path " + dir +

@@ -1,14 +1,13 @@
 // The todo-list writer and its loader: first match, exact messages, untouched files, bad
-// lists, unknown keys, concurrency without lost changes, and no needless re-reads.
+// lists, unknown keys, changes batched during a rewrite, a list replaced while changes run, and
+// no needless re-reads. (The install stress test loses no change among ten install threads.)
 #include "state/todo_list.h"
 
 #include <gtest/gtest.h>
 
 #include <atomic>
 #include <condition_variable>
-#include <map>
 #include <mutex>
-#include <sstream>
 #include <thread>
 #include <vector>
 
@@ -27,12 +26,6 @@ plist::Dict record(std::string id, std::string op) {
   d.set("identifier", std::move(id));
   d.set("operation", std::move(op));
   return d;
-}
-
-std::string repeat(std::string_view piece, int times) {
-  std::string out;
-  for (int i = 0; i < times; ++i) out += piece;
-  return out;
 }
 
 class TodoListTest : public ::testing::Test {
@@ -96,16 +89,11 @@ TEST_F(TodoListTest, NothingIsWrittenWhenNothingMatchesOrTheListIsUnusable) {
       {"identifier that is not a string",
        xmlHead + "<array><dict><key>identifier</key><integer>7</integer></dict></array></plist>",
        {}},
-      {"empty list", xmlHead + "<array/></plist>", {}},
       {"zero-length file", "", {}},
       {"root is a dictionary",
        xmlHead + "<dict/></plist>",
        {"com.vantor.trc.AppSync|todo list is not an array"}},
-      {"garbage", "garbage", {"com.vantor.trc.AppSync|couldn't parse todo list"}},
       {"truncated binary", "bplist00\xd1\x01", {"com.vantor.trc.AppSync|couldn't parse todo list"}},
-      {"deep nesting",
-       xmlHead + repeat("<array>", 100000),
-       {"com.vantor.trc.AppSync|couldn't parse todo list"}},
   };
   for (const Case& c : cases) {
     SCOPED_TRACE(c.name);
@@ -139,16 +127,8 @@ TEST_F(TodoListTest, AFileWrittenByThisWriterIsNotReadAgainButAReplacedOneIs) {
   EXPECT_EQ(load(), (plist::Array{record("com.b", "install"), record("com.c", "DOWNLOADED")}));
 }
 
-TEST_F(TodoListTest, LoadersAcceptBothFormatsAndReportWrongRoots) {
-  plist::Array list{record("com.a", "install")};
-  for (auto format : {plist::Format::Xml, plist::Format::Binary}) {
-    write(list, format);
-    ErrorRef error;
-    EXPECT_EQ(AppsClient::_loadPlist(tr, path, &error), list);
-    EXPECT_EQ(error, nullptr);
-  }
-  tr.logSink()->clear();
-  write(list);
+TEST_F(TodoListTest, LoadersReportWrongRootsAndUnreadableFiles) {
+  write(plist::Array{record("com.a", "install")});
   EXPECT_EQ(AppsClient::_loadDemotedAppsPlist(tr, path, nullptr), std::nullopt);
   EXPECT_EQ(messages(), std::vector<std::string>{
                             "com.vantor.trc.AppSync|demoted apps list is not a dictionary"});
@@ -167,49 +147,6 @@ TEST_F(TodoListTest, LoadersAcceptBothFormatsAndReportWrongRoots) {
   EXPECT_EQ(AppsClient::_loadPlist(tr, dir / "missing.plist", &error), std::nullopt);
   ASSERT_NE(error, nullptr);
   EXPECT_EQ(error->code, ENOENT);
-}
-
-TEST_F(TodoListTest, ConcurrentChangesAreAllKept) {
-  // 10 threads make 1,000 changes each: every thread walks its own 100 records ten times. A
-  // lost update would show as a final state that is not the last round, or as a logged change
-  // whose "from" is not the state the previous change of that record wrote.
-  constexpr int kThreads = 10, kRecords = 100, kRounds = 10;
-  auto id = [](int t, int i) { return "com.t" + std::to_string(t) + ".app" + std::to_string(i); };
-  plist::Array list;
-  for (int t = 0; t < kThreads; ++t) {
-    for (int i = 0; i < kRecords; ++i) list.emplace_back(record(id(t, i), "install"));
-  }
-  write(list, plist::Format::Binary);
-  std::vector<std::thread> threads;
-  for (int t = 0; t < kThreads; ++t) {
-    threads.emplace_back([&, t] {
-      for (int round = 0; round < kRounds; ++round) {
-        for (int i = 0; i < kRecords; ++i)
-          todo.changeAssetID(id(t, i), "R" + std::to_string(round));
-      }
-    });
-  }
-  for (auto& th : threads) th.join();
-
-  plist::Array after = load();
-  ASSERT_EQ(after.size(), list.size());
-  for (const plist::Value& r : after) {
-    ASSERT_EQ(*plist::stringAt(*r.dict(), "operation"), "R" + std::to_string(kRounds - 1));
-  }
-  std::map<std::string, std::string> last;
-  std::size_t changes = 0;
-  const std::string prefix = "com.vantor.trc.AppSync|Changing ";
-  for (const std::string& m : messages()) {
-    ASSERT_EQ(m.rfind(prefix, 0), 0u) << m;
-    std::istringstream words(m.substr(prefix.size()));
-    std::string who, from, fromValue, to, toValue;
-    words >> who >> from >> fromValue >> to >> toValue;
-    auto [it, fresh] = last.try_emplace(who, "install");
-    ASSERT_EQ(fromValue, it->second) << m;
-    it->second = toValue;
-    ++changes;
-  }
-  EXPECT_EQ(changes, static_cast<std::size_t>(kThreads * kRecords * kRounds));
 }
 
 // Holds the first message written until the test lets it go: the writer that logs it is then

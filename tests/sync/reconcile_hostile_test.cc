@@ -71,6 +71,7 @@ TEST(ReconcileHostileTest, RefusesOrSkipsWhatWouldReachOutsideTheRootAndGoesOn) 
     int posixError = 0;
   };
   const std::string homeScreenTold = "Notifying PV we are starting syncing";
+  // clang-format off
   const std::vector<Case> cases = {
       {"identifiers that name no application",
        [](const Upload& u) {
@@ -84,16 +85,10 @@ TEST(ReconcileHostileTest, RefusesOrSkipsWhatWouldReachOutsideTheRootAndGoesOn) 
          list.push_back(kRemoveVictim);
          u.write(u.staged("ApplicationsSync.plist"), list);
        },
-       true,
-       {"performing 1 deletions", homeScreenTold},
-       {"../x targeted"},
-       {kVictim}},
+       true, {"performing 1 deletions", homeScreenTold}, {"../x targeted"}, {kVictim}},
       {"a todo list whose root is not an array",
        [](const Upload& u) { u.write(u.staged("ApplicationsSync.plist"), plist::Dict{}); },
-       true,
-       {"todo list is not an array", "Nothing to do from Caravel", homeScreenTold},
-       {},
-       {}},
+       true, {"todo list is not an array", "Nothing to do from Caravel", homeScreenTold}, {}, {}},
       {"records of the wrong types",
        [](const Upload& u) {
          u.write(u.staged("ApplicationsSync.plist"),
@@ -102,53 +97,35 @@ TEST(ReconcileHostileTest, RefusesOrSkipsWhatWouldReachOutsideTheRootAndGoesOn) 
          u.write((u.outside / "debug.plist").string(), plist::Array{});
          u.link(u.outside / "debug.plist", u.staged("ApplicationsSync.plist-debug.plist"));
        },
-       true,
-       {"performing 1 deletions"},
-       {},
-       {kVictim}},
+       true, {"performing 1 deletions"}, {}, {kVictim}},
       {"a list of 100,000 records",
        [](const Upload& u) {
          plist::Array list(99999, record("com.example.app", "install"));
          list.push_back(kRemoveVictim);
          u.write(u.staged("ApplicationsSync.plist"), list);
        },
-       true,
-       {"performing 1 deletions"},
-       {},
-       {kVictim}},
+       true, {"performing 1 deletions"}, {}, {kVictim}},
       {"a staging area that is a link out of the root",
        [](const Upload& u) {
          u.write((u.outside / "upload/ApplicationsSync.plist").string(),
                  plist::Array{kRemoveVictim});
          u.link(u.outside / "upload", u.device.paths().stagingArea());
        },
-       false,
-       {"Can't move staging area"},
-       {homeScreenTold},
-       {},
-       ELOOP},
+       false, {"Can't move staging area"}, {homeScreenTold}, {}, ELOOP},
       {"a staging area reached through a link out of the root",
        [](const Upload& u) {
          u.write((u.outside / "public/ApplicationSync/ApplicationsSync.plist").string(),
                  plist::Array{kRemoveVictim});
          u.link(u.outside / "public", u.device.paths().publicStaging());
        },
-       false,
-       {"Can't move staging area"},
-       {homeScreenTold},
-       {},
-       EPERM},
+       false, {"Can't move staging area"}, {homeScreenTold}, {}, EPERM},
       {"a work area that is a link out of the root",
        [](const Upload& u) {
          u.write((u.outside / "work/CaravelStuff/ApplicationsSync.plist").string(), plist::Array{});
          u.link(u.outside / "work", u.device.paths().workArea());
          u.write(u.staged("ApplicationsSync.plist"), plist::Array{kRemoveVictim});
        },
-       false,
-       {"can't create work area"},
-       {homeScreenTold},
-       {},
-       EPERM},
+       false, {"can't create work area"}, {homeScreenTold}, {}, EPERM},
       {"a todo list and an icon layout that are links out of the root",
        [](const Upload& u) {
          u.write((u.outside / "todo.plist").string(), plist::Array{kRemoveVictim});
@@ -156,12 +133,10 @@ TEST(ReconcileHostileTest, RefusesOrSkipsWhatWouldReachOutsideTheRootAndGoesOn) 
          u.link(u.outside / "todo.plist", u.staged("ApplicationsSync.plist"));
          u.link(u.outside / "layout.plist", u.staged("PavilionIconState.plist"));
        },
-       true,
-       {"Nothing to do from Caravel", homeScreenTold},
-       {"Sending iconlayout to PV"},
-       {},
+       true, {"Nothing to do from Caravel", homeScreenTold}, {"Sending iconlayout to PV"}, {},
        ELOOP},
   };
+  // clang-format on
 
   for (const Case& c : cases) {
     SCOPED_TRACE(c.name);

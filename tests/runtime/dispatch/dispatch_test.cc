@@ -1,5 +1,6 @@
 // The dispatch primitives under several threads and the manual clock: serial queue, group,
-// semaphore, operation queue, delayed work, and manual-clock waiters.
+// delayed work, and manual-clock waiters. The install queue tests hold the operation queue to
+// its ten, and the in-progress query tests keep a semaphore's signal that came before the wait.
 #include <gtest/gtest.h>
 
 #include <algorithm>
@@ -13,7 +14,6 @@
 #include "runtime/dispatch/clock.h"
 #include "runtime/dispatch/delayed_work.h"
 #include "runtime/dispatch/group.h"
-#include "runtime/dispatch/operation_queue.h"
 #include "runtime/dispatch/semaphore.h"
 #include "runtime/dispatch/serial_queue.h"
 
@@ -84,45 +84,6 @@ TEST(GroupDeathTest, LeavingMoreThanEnteredAborts) {
   GTEST_FLAG_SET(death_test_style, "threadsafe");
   Group group;
   EXPECT_DEATH(group.leave(), "leave\\(\\) without a matching enter\\(\\)");
-}
-
-TEST(SemaphoreTest, SignalsBeforeTheWaitAreNotLost) {
-  ManualClock clock;
-  Semaphore semaphore;
-  semaphore.signal();
-  semaphore.signal();
-  semaphore.wait();
-  // A signal already there is taken even when the deadline has passed; there is no third.
-  EXPECT_TRUE(semaphore.waitUntil(clock, clock.now() - 1s));
-  EXPECT_FALSE(semaphore.waitUntil(clock, clock.now()));
-}
-
-TEST(OperationQueueTest, NeverRunsMoreThanTheLimit) {
-  OperationQueue queue("limited", 10);
-  std::mutex mutex;
-  std::condition_variable changed;
-  int started = 0;
-  bool open = false;
-  std::atomic<int> finished{0};
-  for (int i = 0; i < 50; ++i) {
-    queue.addOperation([&] {
-      std::unique_lock<std::mutex> lock(mutex);
-      ++started;
-      changed.notify_all();
-      changed.wait(lock, [&] { return open; });
-      ++finished;
-    });
-  }
-  {
-    std::unique_lock<std::mutex> lock(mutex);
-    changed.wait(lock, [&] { return started == 10; });
-    EXPECT_EQ(queue.runningCount(), 10u);
-    open = true;
-    changed.notify_all();
-  }
-  queue.waitUntilAllOperationsAreFinished();
-  EXPECT_EQ(finished.load(), 50);
-  EXPECT_EQ(queue.peakRunningCount(), 10u);
 }
 
 TEST(DelayedWorkQueueTest, RunsOnItsThreadOnceTheClockPassesItsTimeEarliestFirst) {

@@ -26,21 +26,19 @@ struct FormatCase {
   std::string expected;
 };
 
+// The scenarios' exact lines cover the common forms; these are the edges.
 TEST(FormatLogMessageTest, EverySpecifier) {
   const char* noText = nullptr;
   std::optional<std::string> noString;
   std::shared_ptr<Thing> noThing;
   const std::vector<FormatCase> cases = {
-      {"plain text", {}, "plain text"},
       {"%s|hello", {kPluginBundleIdentifier}, "com.vantor.trc.AppSync|hello"},
       {"%s", {noText}, "(null)"},
       {"%d %i", {-42, 7}, "-42 7"},
       {"%u %zu", {42u, std::size_t{9}}, "42 9"},
       {"%lld %llu", {INT64_MIN, UINT64_MAX}, "-9223372036854775808 18446744073709551615"},
-      {"existingApp:%d", {true}, "existingApp:1"},
       {"%f|%lf", {0.5, 2.0f}, "0.500000|2.000000"},
       {"success: %c", {'y'}, "success: y"},
-      {"%@", {std::string("an object")}, "an object"},
       {"%{public}@ / %@", {Thing{}, std::make_shared<Thing>()}, "<Thing 7> / <Thing 7>"},
       {"%{public}@", {plist::Value(plist::Array{})}, plist::Value(plist::Array{}).describe()},
       {"secret %{private}@!", {std::string("password")}, "secret <private>!"},
