@@ -161,8 +161,7 @@ bool AppsClient::prepareAppForRestoreUsingCoordination(const std::string& bundle
     return _prepareDemotedAppForRestoreWithBundleId(bundleID, caravelMetadata, sinfData, iconData,
                                                     demotionStatus);
   }
-  return _prepareNonDemotedAppForRestoreWithBundleId(bundleID, caravelMetadata, sinfData,
-                                                     iconData);
+  return _prepareNonDemotedAppForRestoreWithBundleId(bundleID, caravelMetadata, sinfData, iconData);
 }
 
 bool AppsClient::_prepareDemotedAppForRestoreWithBundleId(
