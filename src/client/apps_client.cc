@@ -26,7 +26,6 @@ AppsClient::AppsClient(const Platform& platform)
       restoreStateStore_(platform.paths.restoreState()) {
   _installGroup = std::make_unique<Group>();
   _restorePlaceHoldersWaitGroup = std::make_unique<Group>();
-  _outstandingPFTTransfers.clear();
   _placeholdersForRestoringApps.clear();
   _installOperationQueue =
       std::make_unique<OperationQueue>("AppSync install queue", kMaxConcurrentInstalls);
@@ -60,9 +59,9 @@ AppsClient::AppsClient(const Platform& platform)
 }
 
 AppsClient::~AppsClient() {
-  if (!_outstandingPFTTransfers.empty()) {
+  if (const std::size_t outstanding = _outstandingPFTTransfers.get().size(); outstanding > 0) {
     logError("%s|%{public}@ getting dealloc'd with %lu outstanding PFT transfers!", *this,
-             _outstandingPFTTransfers.size());
+             outstanding);
   }
   std::set<std::string> pendingPlaceholders;
   _restoreQueue->sync([&] { pendingPlaceholders = _placeholdersForRestoringApps; });
@@ -72,7 +71,7 @@ AppsClient::~AppsClient() {
         "notifications",
         *this, toArray(pendingPlaceholders));
   }
-  _outstandingPFTTransfers.clear();
+  _outstandingPFTTransfers.set({});
   _uninstalledApps.reset();
 
   // Every unregistration below returns only when no callback for the client is running or
@@ -121,7 +120,10 @@ bool AppsClient::respondsTo(TRClientOperation operation) const {
       TRClientOperation::assetInstallFailed,
       TRClientOperation::assetTransferSucceeded,
       TRClientOperation::assetTransferUpdatedProgress,
-      TRClientOperation::assetTransferEndedWithSuccess};
+      TRClientOperation::assetTransferEndedWithSuccess,
+      TRClientOperation::currentSyncAnchor,
+      TRClientOperation::prepareForSyncWithHostAnchor,
+      TRClientOperation::reconcileRestoreOfType};
   return kImplemented.count(operation) > 0;
 }
 

@@ -22,6 +22,7 @@
 #include "runtime/dispatch/group.h"
 #include "runtime/dispatch/operation_queue.h"
 #include "runtime/dispatch/serial_queue.h"
+#include "runtime/guarded.h"
 #include "runtime/log/log.h"
 #include "state/loaders.h"
 #include "state/restore_state_store.h"
@@ -59,6 +60,17 @@ class AppsClient : public TRClient,
   // ---- Client protocol ------------------------------------------------------------------------
   std::vector<std::string> supportedDataclasses() override;
   bool respondsTo(TRClientOperation operation) const override;
+
+  // ---- Session entry (sync/session_entry.cc) -------------------------------------------------
+  // "NO_APP_SYNC_ANCHOR": the client keeps no anchor.
+  std::string currentSyncAnchor() override;
+  // True; nothing to prepare.
+  bool prepareForSyncWithHostAnchor(const std::string& hostAnchor,
+                                    ProgressCallback progressCallback, ErrorRef* error) override;
+  using TRClient::prepareForSyncWithHostAnchor;
+  // Tells the home screen a sync starts, makes the work area and, for restore type 2, restores
+  // the apps of the host's restore list. Always true; *error is left absent.
+  bool reconcileRestoreOfType(std::int32_t restoreType, ErrorRef* error) override;
 
   // ---- Start-up ------------------------------------------------------------------------------
   // The notification-center callback for the host's start-up notification; `observer` is the
@@ -225,6 +237,11 @@ class AppsClient : public TRClient,
       const std::optional<plist::Bytes>& sinfData, const std::optional<plist::Bytes>& iconData,
       std::uint64_t demotionStatus);
 
+  // ---- Restore from the host's restore list (restore/restore_info.cc) ------------------------
+  // Hands every app of the restore list to the client's road, waits a bounded time for the
+  // coordinated placeholders, then moves the list to its log copy so that it is processed once.
+  void _processCaravelRestoreInfo();
+
   // ---- Coordinated restore (coordination/coordinated_restore.cc) ------------------------------
   // A restoring coordinator with a complete user-data promise and a restore placeholder; the
   // store daemon downloads the package (not for a demoted app). True when the service has all
@@ -243,6 +260,25 @@ class AppsClient : public TRClient,
                                                    const plist::Bytes& caravelMetadata,
                                                    const std::optional<plist::Bytes>& sinfData,
                                                    const std::optional<plist::Bytes>& iconData);
+
+  // ---- Coordinator and registry events (coordination/coordinator_events.cc) -------------------
+  // Delivered on the services' threads, possibly several at once and twice (observer and
+  // delegate) inside the host daemon.
+  void coordinatorDidInstallPlaceholder(
+      const std::shared_ptr<KCAppInstallCoordinator>& coordinator) override;
+  // Marks the todo list "INSTALLED" (or "FAILED" when the coordinator carries an error) and
+  // drops the app's restore state.
+  void coordinatorDidCompleteSuccessfully(
+      const std::shared_ptr<KCAppInstallCoordinator>& coordinator) override;
+  // Asks the host to send the app's package first, when the host can.
+  void coordinatorShouldPrioritize(
+      const std::shared_ptr<KCAppInstallCoordinator>& coordinator) override;
+  // Records the app as cancelled and, the first time, stops its transfer when the host can.
+  void coordinator(const std::shared_ptr<KCAppInstallCoordinator>& coordinator,
+                   const ErrorRef& canceledWithReason, std::uint64_t client) override;
+  void promiseDidBeginFulfillmentWithIdentifier(std::uint64_t identifier) override;
+  // Legacy road: a cancelled restore install is reported as a failed transfer (TRError 2).
+  void applicationInstallsDidCancel(const ARProxyList& proxies) override;
 
   // ---- Restore placeholder wait (coordination/restore_wait.cc) --------------------------------
   // Each runs one synchronous work item on _restoreQueue; never call them from that queue.
@@ -304,6 +340,8 @@ class AppsClient : public TRClient,
   bool useInstallCoordinator() const { return _useInstallCoordinator; }
   bool hasInstallCoordinatorObserver() const;
   bool finishedWaitingForPlaceHolderInstalls();
+  // Whether the awaited placeholders' set, count and group agree, read in one restore-queue item.
+  bool restoreWaitIsConsistent();
   // Blocks until no legacy install is queued, running or waiting for its retry.
   void waitForInstalls() { _installGroup->wait(); }
   // Blocks until no legacy install is queued or running and no retry is due or running; retries
@@ -334,6 +372,11 @@ class AppsClient : public TRClient,
   // Removes the apps the todo list's "remove" records name, on the client's road.
   void _performDeletions(const plist::Array& toDoList);
 
+  // The restore list's steps (restore/restore_info.cc): each app handed to the client's road,
+  // then the bounded wait for the placeholders counted meanwhile.
+  void _restoreApplicationsOfRestoreList(const plist::Dict& restoreInfo);
+  void _waitForRestorePlaceholderInstalls();
+
   // The two outcomes of one transfer (transfer/transfer_completion.cc). `progress` is the
   // registry's install progress (legacy road) or null.
   void _transferSucceeded(const std::shared_ptr<TRAsset>& asset,
@@ -356,8 +399,9 @@ class AppsClient : public TRClient,
   // Installs attempted since the last read. Atomic add by the install queue; exchanged with 0
   // by _getAndResetNumAppInstallsAttempted.
   std::atomic<std::uint32_t> _numAppInstallsAttempted{0};
-  // Assets whose transfer reported progress and has not ended. Writer: transfer completion.
-  std::set<std::string> _outstandingPFTTransfers;
+  // Assets whose transfer reported progress and has not ended. Writer: transfer completion, on
+  // the host's thread and (a cancelled restore install) the registry's.
+  Guarded<std::set<std::string>> _outstandingPFTTransfers;
   // Runs the legacy install operations, at most kMaxConcurrentInstalls at once.
   std::unique_ptr<OperationQueue> _installOperationQueue;
   // Runs the retries of denied installs once their time comes, on the platform's clock.

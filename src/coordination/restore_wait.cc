@@ -51,4 +51,14 @@ std::int64_t AppsClient::restoringPlaceholderCount() {
   return count;
 }
 
+bool AppsClient::restoreWaitIsConsistent() {
+  bool consistent = false;
+  _restoreQueue->sync([&] {
+    const auto members = static_cast<std::int64_t>(_placeholdersForRestoringApps.size());
+    consistent =
+        members == _restoringPlaceholderCount && members == _restorePlaceHoldersWaitGroup->count();
+  });
+  return consistent;
+}
+
 }  // namespace appsync

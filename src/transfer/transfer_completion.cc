@@ -42,7 +42,7 @@ void AppsClient::assetTransfer(const std::shared_ptr<TRAsset>& asset, double upd
     }
     progress->setCompletedUnitCount(units);
   }
-  _outstandingPFTTransfers.insert(identifier);
+  _outstandingPFTTransfers.with([&](auto& outstanding) { outstanding.insert(identifier); });
 }
 
 void AppsClient::assetTransfer(const std::shared_ptr<TRAsset>& asset, bool succeeded,
@@ -54,7 +54,7 @@ void AppsClient::assetTransfer(const std::shared_ptr<TRAsset>& asset, bool succe
     existingApp = _updatingApps.erase(identifier) > 0;
     userCancelled = _userCancelledApps.erase(identifier) > 0;
   });
-  _outstandingPFTTransfers.erase(identifier);
+  _outstandingPFTTransfers.with([&](auto& outstanding) { outstanding.erase(identifier); });
   logDefault(
       "%s|transfer for asset %{public}@ ended with success %c error %{public}@ existingApp:%d",
       *asset, succeeded ? 'y' : 'n', withError, existingApp ? 1 : 0);
@@ -191,12 +191,13 @@ void AppsClient::assetTransferEndedWithSuccess(bool success) {
     }
   }
 
-  if (_outstandingPFTTransfers.empty()) return;
+  const std::set<std::string> outstanding = _outstandingPFTTransfers.get();
+  if (outstanding.empty()) return;
   if (_useInstallCoordinator) {
-    assetSyncFinishedWithStatus(success, _outstandingPFTTransfers);
+    assetSyncFinishedWithStatus(success, outstanding);
   } else {
     const std::uint64_t state = success ? ARInstallStateFinished : ARInstallStateFailed;
-    for (const std::string& identifier : _outstandingPFTTransfers) {
+    for (const std::string& identifier : outstanding) {
       logDefault(
           "%s|Setting state for outstanding PFT loading phase of asset %{public}@ to "
           "%{public}@",
@@ -209,9 +210,12 @@ void AppsClient::assetTransferEndedWithSuccess(bool success) {
   }
   if (success) {
     logError("%s|Called with success == YES but with %lu outstanding PFT transfers!",
-             _outstandingPFTTransfers.size());
+             outstanding.size());
   }
-  _outstandingPFTTransfers.clear();
+  // Only what was settled goes: a transfer reported meanwhile stays outstanding.
+  _outstandingPFTTransfers.with([&](auto& current) {
+    for (const std::string& identifier : outstanding) current.erase(identifier);
+  });
   _accessQueue->sync([&] {
     _updatingApps.clear();
     _userCancelledApps.clear();
