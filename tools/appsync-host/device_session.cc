@@ -3,6 +3,7 @@
 
 #include <cstdio>
 #include <exception>
+#include <functional>
 #include <string_view>
 #include <utility>
 #include <vector>
@@ -16,18 +17,22 @@ namespace appsync::host {
 
 namespace {
 
-// Writes every message both to memory (for transcripts) and to the device's log file.
+// Writes every message to the device's own log in memory, to the lines not yet taken for a
+// transcript, and to the device's log file.
 class DeviceLogSink : public LogSink {
  public:
-  DeviceLogSink(std::shared_ptr<MemoryLogSink> memory, const std::string& path)
-      : memory_(std::move(memory)), file_(path) {}
+  using Collect = std::function<void(MemoryLogSink::Line)>;
+  DeviceLogSink(std::shared_ptr<MemoryLogSink> memory, Collect collect, const std::string& path)
+      : memory_(std::move(memory)), collect_(std::move(collect)), file_(path) {}
   void write(int category, LogLevel level, std::string_view message) override {
     memory_->write(category, level, message);
+    collect_({category, level, std::string(message)});
     file_.write(category, level, message);
   }
 
  private:
   std::shared_ptr<MemoryLogSink> memory_;
+  Collect collect_;
   FileLogSink file_;
 };
 
@@ -164,17 +169,32 @@ DeviceSession::DeviceSession(std::filesystem::path root, DeviceLock lock,
 }
 
 void DeviceSession::attachLogs() {
-  device_->tr().logger().setSink(
-      std::make_shared<DeviceLogSink>(device_->tr().logSink(), logFile(root_).string()));
+  {
+    // What the device holds already is the first take's, as if it had been gathered too.
+    std::lock_guard lock(unclaimed_->mutex);
+    unclaimed_->produced.log = device_->log().lines();
+    unclaimed_->produced.transactions = device_->transactionLog().entries();
+  }
+  auto collectLine = [unclaimed = unclaimed_](MemoryLogSink::Line line) {
+    std::lock_guard lock(unclaimed->mutex);
+    unclaimed->produced.log.push_back(std::move(line));
+  };
+  device_->tr().logger().setSink(std::make_shared<DeviceLogSink>(
+      device_->tr().logSink(), std::move(collectLine), logFile(root_).string()));
   std::shared_ptr<std::FILE> transactions(openFileForAppending(transactionFile(root_).string()),
                                           [](std::FILE* file) {
                                             if (file) std::fclose(file);
                                           });
-  device_->transactionLog().setEntryListener([transactions](const TransactionLogEntry& entry) {
-    if (!transactions) return;
-    std::fprintf(transactions.get(), "%s\n", entry.describe().c_str());
-    std::fflush(transactions.get());
-  });
+  device_->transactionLog().setEntryListener(
+      [transactions, unclaimed = unclaimed_](const TransactionLogEntry& entry) {
+        {
+          std::lock_guard lock(unclaimed->mutex);
+          unclaimed->produced.transactions.push_back(entry);
+        }
+        if (!transactions) return;
+        std::fprintf(transactions.get(), "%s\n", entry.describe().c_str());
+        std::fflush(transactions.get());
+      });
 }
 
 DeviceSession::~DeviceSession() {
@@ -254,17 +274,8 @@ void DeviceSession::close() {
 }
 
 DeviceSession::Produced DeviceSession::takeProduced() {
-  std::lock_guard lock(producedMutex_);
-  Produced produced;
-  const auto lines = device_->log().lines();
-  for (std::size_t i = logSeen_; i < lines.size(); ++i) produced.log.push_back(lines[i]);
-  logSeen_ = lines.size();
-  const auto entries = device_->transactionLog().entries();
-  for (std::size_t i = transactionsSeen_; i < entries.size(); ++i) {
-    produced.transactions.push_back(entries[i]);
-  }
-  transactionsSeen_ = entries.size();
-  return produced;
+  std::lock_guard lock(unclaimed_->mutex);
+  return std::exchange(unclaimed_->produced, Produced{});
 }
 
 }  // namespace appsync::host

@@ -82,9 +82,13 @@ class DeviceSession {
   mutable std::mutex clientMutex_;
   std::unique_ptr<AppsClient> client_;  // guarded by clientMutex_
   bool closed_ = false;
-  std::mutex producedMutex_;
-  std::size_t logSeen_ = 0;
-  std::size_t transactionsSeen_ = 0;
+  // What the device logged and recorded since the last takeProduced, gathered as it happens, so
+  // that taking it costs what it holds rather than everything since the session began.
+  struct Unclaimed {
+    std::mutex mutex;
+    Produced produced;
+  };
+  std::shared_ptr<Unclaimed> unclaimed_ = std::make_shared<Unclaimed>();
 };
 
 }  // namespace appsync::host
