@@ -1,6 +1,7 @@
 // Ordering the packages the host is to transfer by the device's home-screen icon order, and
 // keeping a copy of that order on disk.
 #include <algorithm>
+#include <set>
 #include <string>
 #include <vector>
 
@@ -44,15 +45,23 @@ plist::Array AppsClient::_orderTheItems(const Platform& platform, plist::Dict& i
   result.reserve(items.size());
 
   if (std::optional<plist::Array> order = fetchIconOrder(platform, log)) {
+    std::set<std::string_view> placed;
     for (const plist::Value& entry : *order) {
       const std::string* identifier = entry.string();
       if (!identifier) continue;
       plist::Value* item = items.find(*identifier);
-      // An identifier listed twice finds nothing the second time: the first placed it.
-      if (!item) continue;
+      // An identifier listed twice is placed by its first listing.
+      if (!item || !placed.insert(*identifier).second) continue;
       pluginLog(log, LogLevel::Default, "%s|prioritize %{public}@", *identifier);
       result.push_back(std::move(*item));
-      items.erase(*identifier);
+    }
+    // The placed items leave `items` at once: erasing them one by one would re-index it each time.
+    if (!placed.empty()) {
+      plist::Dict unplaced;
+      for (plist::Dict::Entry& entry : items) {
+        if (!placed.contains(entry.key)) unplaced.set(std::move(entry.key), std::move(entry.value));
+      }
+      items = std::move(unplaced);
     }
   }
 
