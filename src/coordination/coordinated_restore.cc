@@ -4,6 +4,7 @@
 // alone entirely.
 #include "client/apps_client.h"
 #include "coordination/coordination_support.h"
+#include "restore/placeholder_info.h"
 #include "runtime/plist/codec.h"
 
 namespace appsync {
@@ -14,19 +15,6 @@ namespace {
 
 // Transaction-log step of one application's restore.
 constexpr std::uint64_t kRestoreStep = 2;
-
-// The store metadata dictionary, or absent with *error saying why the bytes are not one.
-std::optional<plist::Dict> parseStoreMetadata(const plist::Bytes& bytes, ErrorRef* error) {
-  plist::ParseError parseError;
-  std::optional<plist::Value> root = plist::parse(bytes, &parseError);
-  if (root && root->dict()) return *root->dict();
-  if (root) {
-    parseError.message =
-        std::string("the root is ") + plist::typeName(root->type()) + ", not a dictionary";
-  }
-  *error = makeError(kPropertyListErrorDomain, 1, parseError.message);
-  return std::nullopt;
-}
 
 // One application's restore: what it obtained from the service, the most recent error any of
 // its calls reported, and what a failure gives back. Each step logs its outcome; false ends the

@@ -5,6 +5,7 @@
 
 #include "platform/bundle_keys.h"
 #include "runtime/log/log.h"
+#include "runtime/plist/codec.h"
 
 namespace appsync {
 
@@ -60,6 +61,18 @@ void reportUnusablePlaceholderPath(const Platform& platform, const std::string& 
       platform, bundleID, std::nullopt, false,
       makeError(kPOSIXErrorDomain, EINVAL,
                 "Bundle identifier would leave the placeholder directory", bundleID));
+}
+
+std::optional<plist::Dict> parseStoreMetadata(const plist::Bytes& bytes, ErrorRef* error) {
+  plist::ParseError parseError;
+  std::optional<plist::Value> root = plist::parse(bytes, &parseError);
+  if (root && root->dict()) return std::move(*root->dict());
+  if (root) {
+    parseError.message =
+        std::string("the root is ") + plist::typeName(root->type()) + ", not a dictionary";
+  }
+  setError(error, makeError(kPropertyListErrorDomain, 1, parseError.message));
+  return std::nullopt;
 }
 
 }  // namespace appsync

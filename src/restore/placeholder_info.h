@@ -7,9 +7,9 @@
 #include <string>
 #include <string_view>
 
+#include "platform/platform.h"
 #include "runtime/error.h"
 #include "runtime/plist/value.h"
-#include "platform/platform.h"
 
 namespace appsync {
 
@@ -35,6 +35,10 @@ std::string placeholderFile(const std::string& directory, std::string_view name)
 plist::Dict placeholderInfoPlist(const std::string& identifier, const plist::Value& version,
                                  const plist::Value& name, const plist::Value& gazette,
                                  bool launchProhibited);
+
+// The store metadata dictionary a restore record carries as bytes; absent, with *error saying
+// why, when they are not a property list or its root is not a dictionary.
+std::optional<plist::Dict> parseStoreMetadata(const plist::Bytes& bytes, ErrorRef* error);
 
 // A value as a message argument: a string as it is (no quotes), anything else described.
 std::string logText(const plist::Value& value);

@@ -4,9 +4,9 @@
 #include <vector>
 
 #include "client/apps_client.h"
+#include "restore/placeholder_info.h"
 #include "runtime/fs/files.h"
 #include "runtime/fs/paths.h"
-#include "restore/placeholder_info.h"
 
 namespace appsync {
 

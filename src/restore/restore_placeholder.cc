@@ -1,10 +1,10 @@
 // The restore road for one application of the restore list: a placeholder directory built from
 // the application's store metadata, icon and SINF, installed through the registry.
 #include "client/apps_client.h"
-#include "runtime/fs/files.h"
-#include "runtime/plist/codec.h"
 #include "platform/bundle_keys.h"
 #include "restore/placeholder_info.h"
+#include "runtime/fs/files.h"
+#include "runtime/plist/codec.h"
 
 namespace appsync {
 
@@ -26,21 +26,16 @@ bool AppsClient::_processCaravelRestoreInfoForApp(const std::string& bundleID,
   logDefault("%s|processing app restore info for '%{public}@'", bundleID);
 
   // Only a dictionary can be store metadata; another root is refused like unreadable bytes.
-  plist::ParseError parseError;
-  std::optional<plist::Value> parsed = plist::parse(caravelMetaData, &parseError);
-  if (parsed && !parsed->dict()) {
-    parseError.message =
-        std::string("the root is ") + plist::typeName(parsed->type()) + ", not a dictionary";
-    parsed.reset();
-  }
+  ErrorRef parseError;
+  const std::optional<plist::Dict> parsed = parseStoreMetadata(caravelMetaData, &parseError);
   if (!parsed) {
     logDefault("%s|failed to parse caravel metadata for '%{public}@'. err=%{public}@", bundleID,
-               makeError(kPropertyListErrorDomain, 1, parseError.message));
+               parseError);
     platform_.transactionLog.logScenario(std::string(kCaravelAppRestoreScenario), 0, false,
                                          bundleID, "Failed to parse caravel metadata");
     return false;
   }
-  const plist::Dict& metadata = *parsed->dict();
+  const plist::Dict& metadata = *parsed;
 
   const plist::Value* storedGazette = metadata.find(kGazetteAppKey);
   const plist::Value gazette = storedGazette ? *storedGazette : plist::Value(false);
