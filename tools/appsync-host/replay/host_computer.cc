@@ -6,6 +6,7 @@
 // host computer does.
 #include <cstdint>
 #include <functional>
+#include <optional>
 #include <string>
 #include <system_error>
 #include <vector>
@@ -16,6 +17,7 @@
 #include "replay/action_table.h"
 #include "replay/actions.h"
 #include "replay/scratch_directory.h"
+#include "runtime/plist/codec.h"
 
 namespace appsync::host::replay {
 
@@ -88,6 +90,25 @@ ActionResult stageApp(StepContext& s) {
   if (withArtwork)
     writeDeviceFile(root, Paths::packageArtwork(dir.string()), artworkFor(identifier));
   return std::nullopt;
+}
+
+// The restore list. A record's "CaravelMetadata" written as a mapping becomes the binary property
+// list the host computer embeds there; data (`!data`) and anything else are written as given.
+ActionResult stageRestoreList(StepContext& s) {
+  const YamlField content = s.step["content"];
+  plist::Value list = content.plist();
+  if (plist::Dict* records = list.dict()) {
+    for (auto& [bundleID, record] : *records) {
+      plist::Dict* fields = record.dict();
+      plist::Value* metadata = fields ? fields->find("CaravelMetadata") : nullptr;
+      if (!metadata || !metadata->dict()) continue;
+      std::string problem;
+      std::optional<plist::Bytes> bytes = plist::writeBinary(*metadata, &problem);
+      if (!bytes) content.fail(bundleID + ".CaravelMetadata: cannot be written: " + problem);
+      *metadata = plist::Value(std::move(*bytes));
+    }
+  }
+  return writePlistAt(s, s.session.paths().restoreList(), list);
 }
 
 // A bundle NAME.app (folder) or NAME.zip in the public staging folder; the result is its path.
@@ -186,11 +207,7 @@ const std::vector<ActionEntry>& stageTable() {
        [](StepContext& s) {
          return writePlistAt(s, s.session.paths().demotedApps(), readDict(s.step["apps"]));
        }},
-      {"restore-list",
-       {"content"},
-       [](StepContext& s) {
-         return writePlistAt(s, s.session.paths().restoreList(), s.step["content"].plist());
-       }},
+      {"restore-list", {"content"}, stageRestoreList},
       {"package", {"identifier", "name", "version", "as", "file", "info", "icon"}, stagePackage},
       {"file", {"path", "plist", "text"}, stageFile},
       {"read-only", {"path"}, makeReadOnly},
