@@ -133,8 +133,6 @@ TEST_F(FakeARPackageTest, TheOptionsSINFBytesMarkTheRecord) {
     bool expected;
   };
   const Case cases[] = {
-      {"a new application without SINF", std::nullopt, std::nullopt, false},
-      {"a new application with SINF", std::nullopt, plist::Bytes{7, 7}, true},
       {"an update without SINF keeps the mark", true, std::nullopt, true},
       {"an update with empty SINF clears it", true, plist::Bytes{}, false},
       {"an update with SINF sets it", false, plist::Bytes{1}, true},

@@ -2,20 +2,21 @@
 // PNG files assembled chunk by chunk (for damaged ones), and application bundles on disk.
 #pragma once
 
+#include <gtest/gtest.h>
 #include <png.h>
 #include <zlib.h>
 
+#include <algorithm>
 #include <csetjmp>
 #include <cstdint>
 #include <cstring>
 #include <filesystem>
-#include <fstream>
 #include <string>
-#include <utility>
 #include <vector>
 
 #include "platform/icon/image.h"
 #include "platform/icon/png_codec.h"
+#include "runtime/fs/files.h"
 
 namespace appsync::testing {
 
@@ -115,16 +116,13 @@ inline Bytes chunk(const std::string& type, const Bytes& data) {
   return out;
 }
 
-inline Bytes ihdr(std::uint32_t width, std::uint32_t height, int depth, int colorType,
-                  int interlace = 0) {
+// Not interlaced.
+inline Bytes ihdr(std::uint32_t width, std::uint32_t height, int depth, int colorType) {
   Bytes data;
   appendBigEndian32(data, width);
   appendBigEndian32(data, height);
-  data.push_back(static_cast<std::uint8_t>(depth));
-  data.push_back(static_cast<std::uint8_t>(colorType));
-  data.push_back(0);
-  data.push_back(0);
-  data.push_back(static_cast<std::uint8_t>(interlace));
+  data.insert(data.end(),
+              {static_cast<std::uint8_t>(depth), static_cast<std::uint8_t>(colorType), 0, 0, 0});
   return chunk("IHDR", data);
 }
 
@@ -155,29 +153,23 @@ inline std::size_t findChunk(const Bytes& png, const std::string& type) {
   return 0;
 }
 
-// A size x size image of one colour.
-inline icon::Image solidImage(int width, int height, std::uint8_t r, std::uint8_t g, std::uint8_t b,
-                              std::uint8_t a = 255) {
+// An opaque image of one colour.
+inline icon::Image solidImage(int width, int height, std::uint8_t r, std::uint8_t g,
+                              std::uint8_t b) {
   icon::Image image(width, height);
   for (std::size_t i = 0; i < image.rgba.size(); i += 4) {
-    image.rgba[i] = r;
-    image.rgba[i + 1] = g;
-    image.rgba[i + 2] = b;
-    image.rgba[i + 3] = a;
+    const std::uint8_t pixel[] = {r, g, b, 255};
+    std::copy_n(pixel, 4, &image.rgba[i]);
   }
   return image;
 }
 
-inline Bytes solidPng(int width, int height, std::uint8_t r = 200, std::uint8_t g = 40,
-                      std::uint8_t b = 90) {
-  return *icon::encodePng(solidImage(width, height, r, g, b));
+inline Bytes solidPng(int width, int height) {
+  return *icon::encodePng(solidImage(width, height, 200, 40, 90));
 }
 
 inline void writeBytes(const std::filesystem::path& path, const Bytes& bytes) {
-  std::filesystem::create_directories(path.parent_path());
-  std::ofstream out(path, std::ios::binary | std::ios::trunc);
-  out.write(reinterpret_cast<const char*>(bytes.data()),
-            static_cast<std::streamsize>(bytes.size()));
+  ASSERT_TRUE(writeFileAtomically(path.string(), bytes)) << path;
 }
 
 // Writes `dict` (the inside of a <dict> element) as the bundle's Info.plist, in XML.
