@@ -1,4 +1,6 @@
-// The actions of replay scripts, run through runAction on a device in a temporary directory.
+// The actions of replay scripts, run through runAction on a device in a temporary directory, and
+// the coordinator expectation, which compares the current coordinator or the last finished one.
+#include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
 #include <filesystem>
@@ -11,6 +13,7 @@
 #include "input_error.h"
 #include "platform/fake/fake_kc_objects.h"
 #include "platform/tr_client.h"
+#include "replay/expectations.h"
 #include "replay/step_context.h"
 #include "support/temp_dir.h"
 #include "yaml_input.h"
@@ -19,6 +22,10 @@ namespace appsync::host::replay {
 namespace {
 
 namespace fs = std::filesystem;
+using ::testing::AllOf;
+using ::testing::HasSubstr;
+using ::testing::StartsWith;
+using ::testing::ThrowsMessage;
 
 class ReplayActionsTest : public ::testing::Test {
  protected:
@@ -36,6 +43,14 @@ class ReplayActionsTest : public ::testing::Test {
     YamlField value = step[selector];
     StepContext context{*session_, step, selector, value, dir_.path()};
     return runAction(context);
+  }
+
+  // What differs for the one expectation `yaml` is (a flow mapping), after checking it.
+  std::optional<std::string> evaluate(const std::string& yaml) {
+    YamlField script = YamlField::loadText("steps:\n  - " + yaml + "\n", "script.yaml");
+    YamlField step = script["steps"].items().at(0);
+    checkExpectation(step);
+    return evaluateExpectation(*session_, step, {});
   }
 
   const fs::path& root() const { return session_->root(); }
@@ -60,15 +75,12 @@ TEST_F(ReplayActionsTest, BadArgumentsAreInputErrorsNamingTheField) {
       {"{call: 'assetInstallFailed:withError:', asset: {identifier: a}, error: {domain: D}}",
        "steps[0].error", "code"},
       {"{plugin: changeAssetID, app: a, stat: X}", "steps[0].stat", "unknown field"},
-      {"{event: hold, service: kitchen}", "steps[0].service", "notifications"},
       {"{platform: fail, service: registry, operation: 'nope:'}", "steps[0].operation",
        "installApplication:withOptions:error:"},
       {"{platform: fail, service: registry, operation: 'addObserver:'}", "steps[0].operation",
        "can fail"},
       {"{platform: fail, service: registry, operation: 'applicationIsInstalled:', times: 0}",
        "steps[0].times", "from 1"},
-      {"{platform: restrict, setting: allowEverything, value: true}", "steps[0].setting",
-       "allowAppRemoval"},
       {"{stage: package, identifier: com.a, name: A, file: A}", "steps[0].file", "NAME.zip"},
       {"{stage: package, identifier: com.a, name: A, as: zip, file: A.app}", "steps[0].file",
        "zip"},
@@ -76,16 +88,10 @@ TEST_F(ReplayActionsTest, BadArgumentsAreInputErrorsNamingTheField) {
       {"{stage: file, path: a.txt, plist: 1, text: x}", "steps[0].text", "not both"},
   };
   for (const Case& c : cases) {
-    SCOPED_TRACE(c.step);
-    try {
-      run(c.step);
-      ADD_FAILURE() << "no error";
-    } catch (const InputError& e) {
-      EXPECT_EQ(e.file(), "script.yaml");
-      EXPECT_EQ(e.line(), 2);
-      EXPECT_EQ(e.field(), c.field) << e.what();
-      EXPECT_NE(std::string(e.what()).find(c.message), std::string::npos) << e.what();
-    }
+    EXPECT_THAT([&] { run(c.step); },
+                ThrowsMessage<InputError>(
+                    AllOf(StartsWith("script.yaml:2: " + c.field + ": "), HasSubstr(c.message))))
+        << c.step;
   }
 }
 
@@ -138,13 +144,9 @@ TEST_F(ReplayActionsTest, PathsThatLeaveTheRootOrCrossALinkAreRefused) {
       {"{event: store-download, app: com.a, package: ../A.zip}", "steps[0].package"},
   };
   for (const auto& [step, field] : cases) {
-    SCOPED_TRACE(step);
-    try {
-      run(step);
-      ADD_FAILURE() << "not refused";
-    } catch (const InputError& e) {
-      EXPECT_EQ(e.field(), field) << e.what();
-    }
+    EXPECT_THAT([&] { run(step); },
+                ThrowsMessage<InputError>(StartsWith("script.yaml:2: " + field + ": ")))
+        << step;
   }
   EXPECT_TRUE(fs::is_empty(outside));
   EXPECT_FALSE(fs::exists(dir_.path() / "escape.txt"));
@@ -184,6 +186,45 @@ TEST_F(ReplayActionsTest, CoordinatorEventsActOnTheCoordinationService) {
   ASSERT_TRUE(coordinator->error());
   EXPECT_EQ(coordinator->error()->code, 10);
   EXPECT_THROW(run("{event: coordinator-prioritize, app: com.c}"), StepFailed);  // forgotten
+}
+
+// Matching current and finished coordinators are shown by the coordinated-install scenario.
+TEST_F(ReplayActionsTest, CoordinatorExpectationsCompareTheCurrentOneElseTheLastFinished) {
+  FakeKCInstallCoordination& kc = session_->device().kc();
+  kc.putCoordinator(KCCoordinatorKind::Restoring, "com.active", 3);
+  kc.putCoordinator(KCCoordinatorKind::Initiating, "com.dropped", 3)
+      ->cancelForReason(makeError("Test", 5, "no"), 1, nullptr);
+  // Cancelled once, and again active under a newer coordinator.
+  kc.putCoordinator(KCCoordinatorKind::Initiating, "com.again", 3)
+      ->cancelForReason(nullptr, 3, nullptr);
+  kc.putCoordinator(KCCoordinatorKind::Updating, "com.again", 3);
+  session_->settle();
+  const struct {
+    const char* expectation;
+    std::optional<std::string> difference;
+  } cases[] = {
+      {"{app: com.active, errorCode: 4}", "com.active: errorCode: expected 4, found none"},
+      {"{app: com.dropped, absent: true}", std::nullopt},
+      {"{app: com.dropped, state: Completed}",
+       "com.dropped: state: expected Completed, found Cancelled"},
+      {"{app: com.dropped, state: Cancelled, errorCode: 6}",
+       "com.dropped: errorCode: expected 6, found 5"},
+      {"{app: com.dropped, state: Active}", "expected a coordinator for com.dropped, found none"},
+      {"{app: com.dropped, state: Cancelled, placeholderInstalled: false}",
+       "expected a current coordinator for com.dropped, found only a finished one (Cancelled)"},
+      {"{app: com.never, state: Completed}",
+       "expected a coordinator for com.never (Completed), found none, current or finished"},
+      // A current coordinator is what is compared while there is one.
+      {"{app: com.again, state: Cancelled}", "com.again: state: expected Cancelled, found Active"},
+      {"{app: com.again, kind: Updating, state: Active}", std::nullopt},
+  };
+  for (const auto& c : cases) {
+    EXPECT_EQ(evaluate(std::string("{expect: coordinator, ") + (c.expectation + 1)), c.difference)
+        << c.expectation;
+  }
+  EXPECT_THROW(evaluate("{expect: coordinator, app: com.dropped, absent: true, errorCode: 5}"),
+               InputError);
+  EXPECT_THROW(evaluate("{expect: coordinator, app: com.dropped, errorCode: five}"), InputError);
 }
 
 }  // namespace

@@ -4,7 +4,6 @@
 #include <gtest/gtest.h>
 
 #include <filesystem>
-#include <fstream>
 #include <map>
 #include <string>
 #include <vector>
@@ -14,6 +13,7 @@
 #include "runtime/fs/files.h"
 #include "runtime/plist/codec.h"
 #include "support/temp_dir.h"
+#include "support/text_file.h"
 #include "support/zip_archive.h"
 
 namespace appsync {
@@ -40,12 +40,8 @@ std::map<std::string, std::string> tree(const fs::path& dir) {
   std::map<std::string, std::string> out;
   std::error_code ec;
   for (fs::recursive_directory_iterator it(dir, ec), end; !ec && it != end; it.increment(ec)) {
-    std::string bytes;
-    if (it->is_regular_file()) {
-      std::ifstream in(it->path(), std::ios::binary);
-      bytes.assign(std::istreambuf_iterator<char>(in), {});
-    }
-    out[fs::relative(it->path(), dir).string()] = bytes;
+    out[fs::relative(it->path(), dir).string()] =
+        it->is_regular_file() ? testing::readText(it->path()) : "";
   }
   return out;
 }

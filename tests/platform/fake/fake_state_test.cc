@@ -203,18 +203,6 @@ TEST(FakeKCStateTest, ALaterProcessCarriesOnWithALoadedCoordinator) {
             id(first.kc.initPromisedOutOfBandTransfer("next", kSyncClient, 0)));
 }
 
-// A device saved before finished coordinators were kept loads with none.
-TEST(FakeKCStateTest, AnOlderStateHasNoFinishedCoordinators) {
-  testing::TempDir dir;
-  Process first(dir), older(dir);
-  withPlaceholder(first.kc, "com.dropped")->cancelForReason(nullptr, kSyncClient, nullptr);
-  plist::Dict state = first.kc.saveState();
-  ASSERT_EQ(state.find("finishedCoordinators")->array()->size(), 1u);
-  state.erase("finishedCoordinators");
-  older.kc.loadState(StateFields(state));
-  EXPECT_TRUE(older.kc.finishedCoordinators().empty());
-}
-
 plist::Dict& game(plist::Dict& s) {
   return *s.find("coordinators")->dict()->find("com.game")->dict();
 }
@@ -246,8 +234,6 @@ TEST(FakeStateTest, ADamagedStateIsRefusedByTheFieldAndChangesNothing) {
       {false, [](plist::Dict& s) { game(s).set("kind", "sideways"); },
        "coordinators.com.game.kind: expected one of any, initiating, updating, restoring, "
        "restoringDemoted"},
-      {false, [](plist::Dict& s) { finished(s).set("state", "active"); },
-       "finishedCoordinators[0].state: expected completed or cancelled"},
       {false, [](plist::Dict& s) { finished(s).erase("errorCode"); },
        "finishedCoordinators[0].errorCode: missing (an error has both a domain and a code)"},
   };

@@ -4,7 +4,9 @@
 #include <gtest/gtest.h>
 
 #include <cstdlib>
-#include <tuple>
+#include <functional>
+#include <span>
+#include <vector>
 
 #include "platform/icon/png_fixtures.h"
 
@@ -12,7 +14,6 @@ namespace appsync::icon {
 namespace {
 
 using testing::Bytes;
-using testing::RawPng;
 
 struct KindCase {
   const char* name;
@@ -21,13 +22,6 @@ struct KindCase {
   bool interlaced;
   bool transparency;  // tRNS: palette alpha table, or one transparent gray/RGB colour
 };
-
-int channels(int colorType) {
-  return colorType == PNG_COLOR_TYPE_GRAY_ALPHA  ? 2
-         : colorType == PNG_COLOR_TYPE_RGB       ? 3
-         : colorType == PNG_COLOR_TYPE_RGB_ALPHA ? 4
-                                                 : 1;
-}
 
 // A sample for pixel (x, y), channel c, spread over the depth's whole range.
 unsigned sampleAt(int x, int y, int c, int depth) {
@@ -45,62 +39,93 @@ png_color paletteColor(unsigned i) {
           static_cast<png_byte>(i * 150 % 256)};
 }
 
-// Builds the file and the RGBA8 it must decode to.
-std::pair<Bytes, Image> makeKind(const KindCase& k, int width, int height) {
-  RawPng raw;
-  std::tie(raw.width, raw.height, raw.bitDepth, raw.colorType, raw.interlaced) =
-      std::tuple(width, height, k.bitDepth, k.colorType, k.interlaced);
-  const int n = channels(k.colorType);
-  const unsigned paletteSize =
-      k.colorType == PNG_COLOR_TYPE_PALETTE ? std::min(1u << k.bitDepth, 200u) : 0;
-  for (unsigned i = 0; i < paletteSize; ++i) raw.palette.push_back(paletteColor(i));
-  if (k.transparency && paletteSize > 0) {
-    // Shorter than the palette: the entries after it are opaque.
-    for (unsigned i = 0; i < (paletteSize + 1) / 2; ++i) {
-      raw.paletteAlpha.push_back(static_cast<std::uint8_t>(i * 60 % 256));
+// Packs samples of `depth` bits into a row, most significant bit first (so 16-bit samples are
+// big-endian); the last byte is padded with zero bits.
+Bytes packSamples(const std::vector<unsigned>& samples, int depth) {
+  Bytes row((samples.size() * depth + 7) / 8);
+  std::size_t bit = 0;
+  for (unsigned s : samples) {
+    for (int b = depth - 1; b >= 0; --b, ++bit) {
+      if ((s >> b) & 1) row[bit / 8] |= static_cast<std::uint8_t>(0x80 >> (bit % 8));
     }
   }
-  if (k.transparency && paletteSize == 0) {
-    // The colour of pixel (1, 1): index, red, green, blue, gray.
-    const auto at = [&](int c) { return static_cast<png_uint_16>(sampleAt(1, 1, c, k.bitDepth)); };
-    raw.hasTransparentColor = true;
-    raw.transparentColor = {0, at(0), at(1), at(2), at(0)};
+  return row;
+}
+
+// The uncompressed image data: each row of packed samples after filter byte 0, in the seven
+// passes of Adam7 when interlaced (a pass without pixels has no rows).
+Bytes imageData(int width, int height, int depth, bool interlaced,
+                const std::function<std::vector<unsigned>(int x, int y)>& samplesAt) {
+  static const int kAdam7[7][4] = {{0, 8, 0, 8}, {4, 8, 0, 8}, {0, 4, 4, 8}, {2, 4, 0, 4},
+                                   {0, 2, 2, 4}, {1, 2, 0, 2}, {0, 1, 1, 2}};
+  static const int kWhole[1][4] = {{0, 1, 0, 1}};
+  Bytes data;
+  for (const auto& [x0, dx, y0, dy] :
+       interlaced ? std::span<const int[4]>(kAdam7) : std::span<const int[4]>(kWhole)) {
+    for (int y = y0; y < height && x0 < width; y += dy) {
+      std::vector<unsigned> row;
+      for (int x = x0; x < width; x += dx) {
+        const std::vector<unsigned> s = samplesAt(x, y);
+        row.insert(row.end(), s.begin(), s.end());
+      }
+      data.push_back(0);
+      const Bytes packed = packSamples(row, depth);
+      data.insert(data.end(), packed.begin(), packed.end());
+    }
   }
+  return data;
+}
+
+// Builds the file, chunk by chunk, and the RGBA8 it must decode to.
+std::pair<Bytes, Image> makeKind(const KindCase& k, int width, int height) {
+  const bool palette = k.colorType == PNG_COLOR_TYPE_PALETTE;
+  const bool gray = (k.colorType & PNG_COLOR_MASK_COLOR) == 0;
+  const bool alpha = (k.colorType & PNG_COLOR_MASK_ALPHA) != 0;
+  const int n = (palette || gray ? 1 : 3) + (alpha ? 1 : 0);
+  const unsigned paletteSize = palette ? std::min(1u << k.bitDepth, 200u) : 0;
+  const auto samplesAt = [&](int x, int y) {
+    std::vector<unsigned> s;
+    for (int c = 0; c < n; ++c) s.push_back(sampleAt(x, y, c, k.bitDepth));
+    if (palette) s[0] %= paletteSize;
+    return s;
+  };
+  std::vector<Bytes> chunks = {testing::ihdr(width, height, k.bitDepth, k.colorType, k.interlaced)};
+  Bytes plte, trns;
+  for (unsigned i = 0; i < paletteSize; ++i) {
+    const png_color c = paletteColor(i);
+    plte.insert(plte.end(), {c.red, c.green, c.blue});
+  }
+  if (palette) chunks.push_back(testing::chunk("PLTE", plte));
+  // A palette's alpha table is shorter than the palette: the entries after it are opaque. Gray
+  // and RGB have one transparent colour: that of pixel (1, 1).
+  const std::vector<unsigned> key = samplesAt(1, 1);
+  for (unsigned i = 0; k.transparency && i < (paletteSize + 1) / 2; ++i) trns.push_back(i * 60);
+  for (int c = 0; k.transparency && !palette && c < n; ++c) {
+    trns.insert(trns.end(), {static_cast<std::uint8_t>(key[c] >> 8), std::uint8_t(key[c])});
+  }
+  if (!trns.empty()) chunks.push_back(testing::chunk("tRNS", trns));
 
   Image expected(width, height);
   for (int y = 0; y < height; ++y) {
-    std::vector<unsigned> samples;
     for (int x = 0; x < width; ++x) {
       std::uint8_t* e = expected.pixel(x, y);
-      std::vector<unsigned> s;
-      for (int c = 0; c < n; ++c) s.push_back(sampleAt(x, y, c, k.bitDepth));
-      if (paletteSize > 0) s[0] %= paletteSize;
-      samples.insert(samples.end(), s.begin(), s.end());
-      switch (k.colorType) {
-        case PNG_COLOR_TYPE_PALETTE: {
-          const png_color p = paletteColor(s[0]);
-          e[0] = p.red, e[1] = p.green, e[2] = p.blue;
-          e[3] = s[0] < raw.paletteAlpha.size() ? raw.paletteAlpha[s[0]] : 255;
-          break;
-        }
-        case PNG_COLOR_TYPE_GRAY:
-        case PNG_COLOR_TYPE_GRAY_ALPHA:
-          e[0] = e[1] = e[2] = toEight(s[0], k.bitDepth);
-          e[3] = n == 2 ? toEight(s[1], k.bitDepth) : 255;
-          if (raw.hasTransparentColor && s[0] == raw.transparentColor.gray) e[3] = 0;
-          break;
-        default:
-          for (int c = 0; c < 3; ++c) e[c] = toEight(s[c], k.bitDepth);
-          e[3] = n == 4 ? toEight(s[3], k.bitDepth) : 255;
-          if (raw.hasTransparentColor && s[0] == raw.transparentColor.red &&
-              s[1] == raw.transparentColor.green && s[2] == raw.transparentColor.blue) {
-            e[3] = 0;
-          }
+      const std::vector<unsigned> s = samplesAt(x, y);
+      if (palette) {
+        const png_color p = paletteColor(s[0]);
+        e[0] = p.red, e[1] = p.green, e[2] = p.blue;
+        e[3] = s[0] < trns.size() ? trns[s[0]] : 255;
+        continue;
       }
+      for (int c = 0; c < 3; ++c) e[c] = toEight(s[gray ? 0 : c], k.bitDepth);
+      e[3] = alpha ? toEight(s[n - 1], k.bitDepth) : 255;
+      if (k.transparency && s == key) e[3] = 0;
     }
-    raw.rows.push_back(testing::packSamples(samples, k.bitDepth));
   }
-  return {testing::writeRawPng(raw), expected};
+  chunks.push_back(testing::chunk(
+      "IDAT",
+      testing::zlibCompress(imageData(width, height, k.bitDepth, k.interlaced, samplesAt))));
+  chunks.push_back(testing::chunk("IEND", {}));
+  return {testing::pngFromChunks(chunks), expected};
 }
 
 TEST(PngDecodeTest, EveryKindDecodesToItsColours) {

@@ -1,5 +1,5 @@
-// Test fixtures for the icon renderer: PNG files of every kind written with libpng directly,
-// PNG files assembled chunk by chunk (for damaged ones), and application bundles on disk.
+// Test fixtures for the icon renderer: PNG files assembled chunk by chunk (of every kind, and
+// damaged ones), and application bundles on disk.
 #pragma once
 
 #include <gtest/gtest.h>
@@ -7,7 +7,6 @@
 #include <zlib.h>
 
 #include <algorithm>
-#include <csetjmp>
 #include <cstdint>
 #include <cstring>
 #include <filesystem>
@@ -21,84 +20,6 @@
 namespace appsync::testing {
 
 using Bytes = std::vector<std::uint8_t>;
-
-// A PNG described as it is stored: rows of packed samples (big-endian at 16 bits).
-struct RawPng {
-  int width = 0;
-  int height = 0;
-  int bitDepth = 8;
-  int colorType = PNG_COLOR_TYPE_RGB_ALPHA;
-  bool interlaced = false;
-  std::vector<Bytes> rows;
-  std::vector<png_color> palette;
-  Bytes paletteAlpha;                // tRNS of a palette image
-  bool hasTransparentColor = false;  // tRNS of a gray or RGB image
-  png_color_16 transparentColor{};
-};
-
-namespace detail {
-
-inline void appendBytes(png_structp png, png_bytep data, std::size_t n) {
-  auto* out = static_cast<Bytes*>(png_get_io_ptr(png));
-  out->insert(out->end(), data, data + n);
-}
-
-// Left by longjmp on a libpng error; holds nothing with a destructor.
-inline bool writeRaw(png_structp png, png_infop info, const RawPng* raw, png_bytepp rows) {
-  if (setjmp(png_jmpbuf(png))) return false;
-  png_set_IHDR(png, info, raw->width, raw->height, raw->bitDepth, raw->colorType,
-               raw->interlaced ? PNG_INTERLACE_ADAM7 : PNG_INTERLACE_NONE,
-               PNG_COMPRESSION_TYPE_DEFAULT, PNG_FILTER_TYPE_DEFAULT);
-  if (!raw->palette.empty()) {
-    png_set_PLTE(png, info, raw->palette.data(), static_cast<int>(raw->palette.size()));
-  }
-  if (!raw->paletteAlpha.empty()) {
-    png_set_tRNS(png, info, raw->paletteAlpha.data(), static_cast<int>(raw->paletteAlpha.size()),
-                 nullptr);
-  }
-  if (raw->hasTransparentColor) png_set_tRNS(png, info, nullptr, 0, &raw->transparentColor);
-  png_write_info(png, info);
-  if (raw->interlaced) png_set_interlace_handling(png);
-  png_write_image(png, rows);
-  png_write_end(png, nullptr);
-  return true;
-}
-
-}  // namespace detail
-
-inline Bytes writeRawPng(const RawPng& raw) {
-  Bytes out;
-  png_structp png = png_create_write_struct(PNG_LIBPNG_VER_STRING, nullptr, nullptr, nullptr);
-  png_infop info = png_create_info_struct(png);
-  png_set_write_fn(png, &out, detail::appendBytes, nullptr);
-  std::vector<png_bytep> rows;
-  for (const Bytes& row : raw.rows) rows.push_back(const_cast<png_bytep>(row.data()));
-  const bool ok = detail::writeRaw(png, info, &raw, rows.data());
-  png_destroy_write_struct(&png, &info);
-  return ok ? out : Bytes{};
-}
-
-// Packs samples of `depth` bits into a PNG row (most significant bits first; 16-bit big-endian).
-inline Bytes packSamples(const std::vector<unsigned>& samples, int depth) {
-  Bytes row;
-  if (depth == 16) {
-    for (unsigned s : samples) {
-      row.push_back(static_cast<std::uint8_t>(s >> 8));
-      row.push_back(static_cast<std::uint8_t>(s & 0xff));
-    }
-    return row;
-  }
-  const int perByte = 8 / depth;
-  for (std::size_t i = 0; i < samples.size(); i += perByte) {
-    unsigned byte = 0;
-    for (int k = 0; k < perByte; ++k) {
-      const unsigned s = i + k < samples.size() ? samples[i + k] : 0;
-      byte |= s << (8 - depth * (k + 1));
-    }
-    row.push_back(static_cast<std::uint8_t>(byte));
-  }
-  return row;
-}
 
 // Chunk-level assembly.
 inline void appendBigEndian32(Bytes& out, std::uint32_t v) {
@@ -116,13 +37,13 @@ inline Bytes chunk(const std::string& type, const Bytes& data) {
   return out;
 }
 
-// Not interlaced.
-inline Bytes ihdr(std::uint32_t width, std::uint32_t height, int depth, int colorType) {
+inline Bytes ihdr(std::uint32_t width, std::uint32_t height, int depth, int colorType,
+                  bool interlaced = false) {
   Bytes data;
   appendBigEndian32(data, width);
   appendBigEndian32(data, height);
-  data.insert(data.end(),
-              {static_cast<std::uint8_t>(depth), static_cast<std::uint8_t>(colorType), 0, 0, 0});
+  data.insert(data.end(), {static_cast<std::uint8_t>(depth), static_cast<std::uint8_t>(colorType),
+                           0, 0, static_cast<std::uint8_t>(interlaced)});
   return chunk("IHDR", data);
 }
 
