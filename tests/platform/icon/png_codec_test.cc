@@ -14,6 +14,10 @@ namespace appsync::icon {
 namespace {
 
 using testing::Bytes;
+using testing::chunk;
+using testing::ihdr;
+using testing::pngFromChunks;
+using testing::zlibCompress;
 
 struct KindCase {
   const char* name;
@@ -39,21 +43,9 @@ png_color paletteColor(unsigned i) {
           static_cast<png_byte>(i * 150 % 256)};
 }
 
-// Packs samples of `depth` bits into a row, most significant bit first (so 16-bit samples are
-// big-endian); the last byte is padded with zero bits.
-Bytes packSamples(const std::vector<unsigned>& samples, int depth) {
-  Bytes row((samples.size() * depth + 7) / 8);
-  std::size_t bit = 0;
-  for (unsigned s : samples) {
-    for (int b = depth - 1; b >= 0; --b, ++bit) {
-      if ((s >> b) & 1) row[bit / 8] |= static_cast<std::uint8_t>(0x80 >> (bit % 8));
-    }
-  }
-  return row;
-}
-
-// The uncompressed image data: each row of packed samples after filter byte 0, in the seven
-// passes of Adam7 when interlaced (a pass without pixels has no rows).
+// The uncompressed image data: each row after filter byte 0, its samples packed most significant
+// bit first (so 16-bit samples are big-endian) and its last byte padded with zero bits; in the
+// seven passes of Adam7 when interlaced (a pass without pixels has no rows).
 Bytes imageData(int width, int height, int depth, bool interlaced,
                 const std::function<std::vector<unsigned>(int x, int y)>& samplesAt) {
   static const int kAdam7[7][4] = {{0, 8, 0, 8}, {4, 8, 0, 8}, {0, 4, 4, 8}, {2, 4, 0, 4},
@@ -63,14 +55,16 @@ Bytes imageData(int width, int height, int depth, bool interlaced,
   for (const auto& [x0, dx, y0, dy] :
        interlaced ? std::span<const int[4]>(kAdam7) : std::span<const int[4]>(kWhole)) {
     for (int y = y0; y < height && x0 < width; y += dy) {
-      std::vector<unsigned> row;
-      for (int x = x0; x < width; x += dx) {
-        const std::vector<unsigned> s = samplesAt(x, y);
-        row.insert(row.end(), s.begin(), s.end());
-      }
       data.push_back(0);
-      const Bytes packed = packSamples(row, depth);
-      data.insert(data.end(), packed.begin(), packed.end());
+      int bit = 0;
+      for (int x = x0; x < width; x += dx) {
+        for (unsigned s : samplesAt(x, y)) {
+          for (int b = depth - 1; b >= 0; --b, ++bit) {
+            if (bit % 8 == 0) data.push_back(0);
+            if ((s >> b) & 1) data.back() |= static_cast<std::uint8_t>(0x80 >> (bit % 8));
+          }
+        }
+      }
     }
   }
   return data;
@@ -89,13 +83,13 @@ std::pair<Bytes, Image> makeKind(const KindCase& k, int width, int height) {
     if (palette) s[0] %= paletteSize;
     return s;
   };
-  std::vector<Bytes> chunks = {testing::ihdr(width, height, k.bitDepth, k.colorType, k.interlaced)};
+  std::vector<Bytes> chunks = {ihdr(width, height, k.bitDepth, k.colorType, k.interlaced)};
   Bytes plte, trns;
   for (unsigned i = 0; i < paletteSize; ++i) {
     const png_color c = paletteColor(i);
     plte.insert(plte.end(), {c.red, c.green, c.blue});
   }
-  if (palette) chunks.push_back(testing::chunk("PLTE", plte));
+  if (palette) chunks.push_back(chunk("PLTE", plte));
   // A palette's alpha table is shorter than the palette: the entries after it are opaque. Gray
   // and RGB have one transparent colour: that of pixel (1, 1).
   const std::vector<unsigned> key = samplesAt(1, 1);
@@ -103,7 +97,7 @@ std::pair<Bytes, Image> makeKind(const KindCase& k, int width, int height) {
   for (int c = 0; k.transparency && !palette && c < n; ++c) {
     trns.insert(trns.end(), {static_cast<std::uint8_t>(key[c] >> 8), std::uint8_t(key[c])});
   }
-  if (!trns.empty()) chunks.push_back(testing::chunk("tRNS", trns));
+  if (!trns.empty()) chunks.push_back(chunk("tRNS", trns));
 
   Image expected(width, height);
   for (int y = 0; y < height; ++y) {
@@ -121,11 +115,10 @@ std::pair<Bytes, Image> makeKind(const KindCase& k, int width, int height) {
       if (k.transparency && s == key) e[3] = 0;
     }
   }
-  chunks.push_back(testing::chunk(
-      "IDAT",
-      testing::zlibCompress(imageData(width, height, k.bitDepth, k.interlaced, samplesAt))));
-  chunks.push_back(testing::chunk("IEND", {}));
-  return {testing::pngFromChunks(chunks), expected};
+  chunks.push_back(
+      chunk("IDAT", zlibCompress(imageData(width, height, k.bitDepth, k.interlaced, samplesAt))));
+  chunks.push_back(chunk("IEND", {}));
+  return {pngFromChunks(chunks), expected};
 }
 
 TEST(PngDecodeTest, EveryKindDecodesToItsColours) {
@@ -189,10 +182,6 @@ Bytes withByte(Bytes bytes, std::size_t offset, std::uint8_t xorMask) {
 }
 
 TEST(PngDecodeTest, RefusesDamagedAndHostileFiles) {
-  using testing::chunk;
-  using testing::ihdr;
-  using testing::pngFromChunks;
-  using testing::zlibCompress;
   const Bytes good = *encodePng(testing::solidImage(16, 16, 10, 20, 30));
   const std::size_t idat = testing::findChunk(good, "IDAT");
   const std::size_t idatLength = (good[idat + 2] << 8) | good[idat + 3];

@@ -95,10 +95,7 @@ inline void writeBytes(const std::filesystem::path& path, const Bytes& bytes) {
 
 // Writes `dict` (the inside of a <dict> element) as the bundle's Info.plist, in XML.
 inline void writeInfoPlist(const std::filesystem::path& bundle, const std::string& dict) {
-  const std::string text =
-      "<?xml version=\"1.0\" encoding=\"UTF-8\"?>\n"
-      "<plist version=\"1.0\">\n<dict>\n" +
-      dict + "\n</dict>\n</plist>\n";
+  const std::string text = "<plist version=\"1.0\"><dict>" + dict + "</dict></plist>";
   writeBytes(bundle / "Info.plist", Bytes(text.begin(), text.end()));
 }
 
