@@ -19,6 +19,12 @@
 namespace appsync {
 namespace {
 
+Platform withAll(const Platform& platform) { return platform; }
+template <typename Wrapper, typename... Rest>
+Platform withAll(const Platform& platform, Wrapper& wrapper, Rest&... rest) {
+  return withAll(platform.with(wrapper), rest...);
+}
+
 TEST(ServiceWrappersTest, EachCallReachesItsOwnCounterpart) {
   testing::TempDir root;
   FakePlatform device(root.path());
@@ -33,18 +39,8 @@ TEST(ServiceWrappersTest, EachCallReachesItsOwnCounterpart) {
   QIIconServiceWrapper qi(device.qi());
   AITransactionLogWrapper transactionLog(device.transactionLog());
   SystemServicesWrapper system(device.system());
-  const Platform wrapped = device.platform()
-                               .with(tr)
-                               .with(ar)
-                               .with(kc)
-                               .with(em)
-                               .with(sw)
-                               .with(rs)
-                               .with(bz)
-                               .with(pv)
-                               .with(qi)
-                               .with(transactionLog)
-                               .with(system);
+  const Platform wrapped =
+      withAll(device.platform(), tr, ar, kc, em, sw, rs, bz, pv, qi, transactionLog, system);
 
   // Operations that share a signature: a forwarder calling the wrong one would still compile.
   ARApplicationWorkspaceObserverProtocol observer;

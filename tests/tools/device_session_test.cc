@@ -2,6 +2,7 @@
 // (its saved state names paths under its root), and what it logs is taken step by step.
 #include "device_session.h"
 
+#include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
 #include <filesystem>
@@ -11,52 +12,38 @@
 #include "input_error.h"
 #include "support/temp_dir.h"
 
-namespace appsync {
+namespace appsync::host {
 namespace {
 
-TEST(DeviceSessionTest, ASecondHolderIsRefusedUntilTheFirstHasClosed) {
+using ::testing::HasSubstr;
+using ::testing::ThrowsMessage;
+
+TEST(DeviceSessionTest, OneHolderAtATimeAndOnlyWhereTheDeviceWasMade) {
   testing::TempDir dir;
-  const auto root = dir.path() / "device";
-  host::DeviceSession::create(root, {})->close();
-  auto first = host::DeviceSession::open(root);
-  try {
-    host::DeviceSession::open(root);
-    FAIL() << "a second session opened a device in use";
-  } catch (const host::DeviceBusy& busy) {
-    EXPECT_NE(std::string(busy.what()).find("in use by another appsync-host command"),
-              std::string::npos)
-        << busy.what();
-  }
+  const auto made = dir.path() / "made", moved = dir.path() / "moved";
+  DeviceSession::create(made, {})->close();
+  auto first = DeviceSession::open(made);
+  EXPECT_THAT([&] { DeviceSession::open(made); },
+              ThrowsMessage<DeviceBusy>(HasSubstr("in use by another appsync-host command")));
   first->close();
   first.reset();
-  EXPECT_NO_THROW(host::DeviceSession::open(root)->close());
-}
+  EXPECT_NO_THROW(DeviceSession::open(made)->close());
 
-TEST(DeviceSessionTest, AMovedDeviceIsRefusedWithWhereItWasMade) {
-  testing::TempDir dir;
-  const auto made = dir.path() / "made";
-  host::DeviceSession::create(made, {})->close();
-  const auto moved = dir.path() / "moved";
   std::filesystem::rename(made, moved);
-  try {
-    host::DeviceSession::open(moved);
-    FAIL() << "a moved device was opened";
-  } catch (const host::InputError& error) {
-    EXPECT_NE(std::string(error.what()).find("was made at " + made.string()), std::string::npos)
-        << error.what();
-  }
+  EXPECT_THAT([&] { DeviceSession::open(moved); },
+              ThrowsMessage<InputError>(HasSubstr("was made at " + made.string())));
   std::filesystem::rename(moved, made);
-  EXPECT_NO_THROW(host::DeviceSession::open(made)->close());
+  EXPECT_NO_THROW(DeviceSession::open(made)->close());
 }
 
 // Each take holds what was logged and recorded since the one before, once and in order, while
 // the device's own log keeps every line.
 TEST(DeviceSessionTest, EachTakeHoldsOnlyWhatCameSinceTheLastOne) {
   testing::TempDir dir;
-  auto session = host::DeviceSession::create(dir.path() / "device", {});
+  auto session = DeviceSession::create(dir.path() / "device", {});
   session->takeProduced();
   const LogCategory& log = session->device().tr().TRGetLogCategory(1);
-  auto messages = [](const host::DeviceSession::Produced& produced) {
+  auto messages = [](const DeviceSession::Produced& produced) {
     std::vector<std::string> texts;
     for (const auto& line : produced.log) texts.push_back(line.message);
     return texts;
@@ -85,4 +72,4 @@ TEST(DeviceSessionTest, EachTakeHoldsOnlyWhatCameSinceTheLastOne) {
 }
 
 }  // namespace
-}  // namespace appsync
+}  // namespace appsync::host

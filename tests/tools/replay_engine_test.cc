@@ -3,6 +3,7 @@
 #include <gtest/gtest.h>
 
 #include <filesystem>
+#include <functional>
 #include <mutex>
 #include <sstream>
 #include <string>
@@ -19,11 +20,6 @@ namespace {
 
 using namespace std::chrono_literals;
 using host::replay::Runner;
-using host::replay::Transcript;
-
-host::replay::Script scriptOf(const testing::TempDir& dir, const std::string& text) {
-  return host::replay::readScript(host::YamlField::loadText(text, dir / "script.yaml"), dir.path());
-}
 
 std::size_t countLines(const std::string& text, const std::string& part) {
   std::size_t count = 0;
@@ -32,12 +28,30 @@ std::size_t countLines(const std::string& text, const std::string& part) {
   return count;
 }
 
+// A device in a temporary directory, and the replay on it of script.yaml: "steps:" on line 1,
+// then `steps`.
+struct EngineReplay {
+  explicit EngineReplay(const FakePlatform::Options& options = {})
+      : session(host::DeviceSession::create(dir.path() / "device", options)) {}
+  std::size_t run(const std::string& steps, const std::function<void(Runner&)>& setUp = {},
+                  bool quiet = false) {
+    const auto script = host::replay::readScript(
+        host::YamlField::loadText("steps:\n" + steps, dir / "script.yaml"), dir.path());
+    host::replay::Transcript transcript(out, quiet);
+    Runner runner(script, *session, transcript, errors);
+    if (setUp) setUp(runner);
+    return runner.run();
+  }
+  testing::TempDir dir;
+  std::unique_ptr<host::DeviceSession> session;
+  std::ostringstream out, errors;
+};
+
 // Timers due within one advance fire one by one, each at its own time: a single jump would
 // make them all fire at the end, together.
 TEST(ReplayEngineTest, AdvanceFiresEachTimerAtItsDeadlineInOrder) {
-  testing::TempDir dir;
-  auto session = host::DeviceSession::create(dir.path() / "device", {});
-  ManualClock& clock = session->clock();
+  EngineReplay replay;
+  ManualClock& clock = replay.session->clock();
   const TimePoint start = clock.now();
   DelayedWorkQueue timers("timers", clock);
   std::mutex mutex;
@@ -54,46 +68,33 @@ TEST(ReplayEngineTest, AdvanceFiresEachTimerAtItsDeadlineInOrder) {
   timers.after(25s, fire("b"));
   timers.after(41s, fire("d"));
 
-  const auto script = scriptOf(dir, "steps:\n  - advance: 30s\n  - advance: 10s\n");
-  std::ostringstream out, errors;
-  Transcript transcript(out, false);
-  {
-    Runner runner(script, *session, transcript, errors);
-    runner.alsoSettle([&] { timers.waitUntilIdle(); });
-    EXPECT_EQ(runner.run(), 0u) << errors.str();
-  }
+  EXPECT_EQ(replay.run("  - advance: 30s\n  - advance: 10s\n",
+                       [&](Runner& r) { r.alsoSettle([&] { timers.waitUntilIdle(); }); }),
+            0u)
+      << replay.errors.str();
   std::lock_guard lock(mutex);
   EXPECT_EQ(fired,
             (std::vector<std::pair<std::string, Duration>>{{"a", 10s}, {"b", 25s}, {"c", 30s}}));
   EXPECT_EQ(clock.now() - start, 40s);
-  EXPECT_EQ(countLines(out.str(), "\"outcome\":\"ok\""), 2u) << out.str();
+  EXPECT_EQ(countLines(replay.out.str(), "\"outcome\":\"ok\""), 2u) << replay.out.str();
 }
 
 // A held service keeps its events across the steps that follow (the engine settles the device
 // after every step without letting them go); the end of the replay delivers them.
 TEST(ReplayEngineTest, HeldEventsWaitUntilTheScriptReleasesThem) {
-  testing::TempDir dir;
-  auto session = host::DeviceSession::create(dir.path() / "device", {});
-  const auto script = scriptOf(dir,
-                               "steps:\n"
-                               "  - call: supportedDataclasses\n"
-                               "  - event: hold\n"
-                               "    service: registry\n"
-                               "  - platform: install-app\n"
-                               "    identifier: com.example.notes\n"
-                               "    name: Notes\n"
-                               "  - expect: registry\n"
-                               "    app: com.example.notes\n"
-                               "    version: \"1.0\"\n");
-  CallbackThread& registryEvents = session->device().ar().callbackThread();
+  EngineReplay replay;
+  CallbackThread& registryEvents = replay.session->device().ar().callbackThread();
   std::vector<std::size_t> heldAfterSettling;  // events still queued each time the device rests
-  std::ostringstream out, errors;
-  Transcript transcript(out, false);
-  {
-    Runner runner(script, *session, transcript, errors);
-    runner.alsoSettle([&] { heldAfterSettling.push_back(registryEvents.pendingCount()); });
-    EXPECT_EQ(runner.run(), 0u) << errors.str() << out.str();
-  }
+  EXPECT_EQ(replay.run("  - call: supportedDataclasses\n"
+                       "  - {event: hold, service: registry}\n"
+                       "  - {platform: install-app, identifier: com.example.notes, name: Notes}\n"
+                       "  - {expect: registry, app: com.example.notes, version: \"1.0\"}\n",
+                       [&](Runner& r) {
+                         r.alsoSettle(
+                             [&] { heldAfterSettling.push_back(registryEvents.pendingCount()); });
+                       }),
+            0u)
+      << replay.errors.str() << replay.out.str();
   ASSERT_GE(heldAfterSettling.size(), 4u);
   EXPECT_EQ(heldAfterSettling[1], 0u);  // held, nothing happened yet
   EXPECT_GT(heldAfterSettling[2], 0u);  // the install's events wait ...
@@ -105,62 +106,40 @@ TEST(ReplayEngineTest, HeldEventsWaitUntilTheScriptReleasesThem) {
 // An await of a step that waits for a held service fails with the reason instead of hanging,
 // and the replay still ends: what is held is let go at the end and the step finishes.
 TEST(ReplayEngineTest, AnAwaitThatCouldNeverFinishSaysWhy) {
-  testing::TempDir dir;
-  FakePlatform::Options daemon;
-  daemon.coordination = true;
-  daemon.mainBundleIdentifier = std::string(kHostDaemonBundleIdentifier);
-  auto session = host::DeviceSession::create(dir.path() / "device", daemon);
-  const auto script = scriptOf(dir,
-                               "steps:\n"
-                               "  - event: hold\n"
-                               "    service: notifications\n"
-                               "  - event: startup\n"
-                               "    background: up\n"
-                               "  - await: up\n");
-  std::ostringstream out, errors;
-  Transcript transcript(out, false);
-  {
-    Runner runner(script, *session, transcript, errors);
-    runner.setPatience(std::chrono::milliseconds(50));
-    EXPECT_EQ(runner.run(), 1u);
-  }
-  EXPECT_NE(errors.str().find("script.yaml:6: steps[2]: still running while the script holds "
-                              "notifications: release it before the await"),
+  EngineReplay replay(
+      {.coordination = true, .mainBundleIdentifier = std::string(kHostDaemonBundleIdentifier)});
+  EXPECT_EQ(replay.run("  - {event: hold, service: notifications}\n"
+                       "  - {event: startup, background: up}\n"
+                       "  - await: up\n",
+                       [](Runner& r) { r.setPatience(std::chrono::milliseconds(50)); }),
+            1u);
+  EXPECT_NE(replay.errors.str().find("script.yaml:4: steps[2]: still running while the script "
+                                     "holds notifications: release it before the await"),
             std::string::npos)
-      << errors.str();
-  EXPECT_TRUE(session->client().hasInstallCoordinatorObserver());
+      << replay.errors.str();
+  EXPECT_TRUE(replay.session->client().hasInstallCoordinatorObserver());
 }
 
 TEST(ReplayEngineTest, BackgroundStepsAreCheckedWhenAwaitedAndFailWhenForgotten) {
-  testing::TempDir dir;
-  auto session = host::DeviceSession::create(dir.path() / "device", {});
-  const auto script = scriptOf(dir,
-                               "steps:\n"
-                               "  - call: supportedDataclasses\n"
-                               "    background: first\n"
-                               "  - call: supportedDataclasses\n"
-                               "    background: second\n"
-                               "  - await: second\n"
-                               "    result: [Calendar]\n"
-                               "  - await: first\n"
-                               "    result: [Application]\n"
-                               "  - call: supportedDataclasses\n"
-                               "    background: forgotten\n");
-  std::ostringstream out, errors;
-  Transcript transcript(out, true);
-  Runner runner(script, *session, transcript, errors);
-  EXPECT_EQ(runner.run(), 2u);
-  const std::string file = (dir / "script.yaml");
-  EXPECT_NE(errors.str().find(file + ":6: steps[2]: result[0]: expected \"Calendar\", found "
-                                     "\"Application\""),
+  EngineReplay replay;
+  EXPECT_EQ(replay.run("  - {call: supportedDataclasses, background: first}\n"
+                       "  - {call: supportedDataclasses, background: second}\n"
+                       "  - {await: second, result: [Calendar]}\n"
+                       "  - {await: first, result: [Application]}\n"
+                       "  - {call: supportedDataclasses, background: forgotten}\n",
+                       {}, true),
+            2u);
+  const std::string file = replay.dir / "script.yaml", errors = replay.errors.str();
+  EXPECT_NE(errors.find(file + ":4: steps[2]: result[0]: expected \"Calendar\", found "
+                               "\"Application\""),
             std::string::npos)
-      << errors.str();
-  EXPECT_NE(errors.str().find(file + ":10: steps[4]: background step forgotten never awaited"),
+      << errors;
+  EXPECT_NE(errors.find(file + ":6: steps[4]: background step forgotten never awaited"),
             std::string::npos)
-      << errors.str();
+      << errors;
   // Quiet: the two failed steps only (the summary is the command's).
-  EXPECT_EQ(countLines(out.str(), "\"step\""), 2u) << out.str();
-  EXPECT_EQ(countLines(out.str(), "\"result\":[\"Application\"]"), 2u) << out.str();
+  EXPECT_EQ(countLines(replay.out.str(), "\"step\""), 2u) << replay.out.str();
+  EXPECT_EQ(countLines(replay.out.str(), "\"result\":[\"Application\"]"), 2u) << replay.out.str();
 }
 
 TEST(ReplayEngineTest, FailedExpectationsAreReportedAndTheReplayGoesOnToExitOne) {
@@ -173,17 +152,10 @@ TEST(ReplayEngineTest, FailedExpectationsAreReportedAndTheReplayGoesOnToExitOne)
   testing::writeText(script,
                      "device: {}\n"
                      "steps:\n"
-                     "  - expect: todo\n"
-                     "    app: com.example.notes\n"
-                     "    state: SENT\n"
-                     "  - expect: file\n"
-                     "    path: keep.txt\n"
-                     "  - expect: file\n"
-                     "    path: var/mobile/nothing.plist\n"
-                     "    plist: [1]\n"
-                     "  - expect: registry\n"
-                     "    app: com.example.notes\n"
-                     "    absent: true\n");
+                     "  - {expect: todo, app: com.example.notes, state: SENT}\n"
+                     "  - {expect: file, path: keep.txt}\n"
+                     "  - {expect: file, path: var/mobile/nothing.plist, plist: [1]}\n"
+                     "  - {expect: registry, app: com.example.notes, absent: true}\n");
   std::ostringstream out, errors;
   const host::replay::ReplayRequest request{.script = script, .root = root, .fresh = true};
   EXPECT_EQ(host::replay::replay(request, out, errors), host::kExitFailed);
@@ -192,7 +164,7 @@ TEST(ReplayEngineTest, FailedExpectationsAreReportedAndTheReplayGoesOnToExitOne)
                                      "todo list"),
             std::string::npos)
       << errors.str();
-  EXPECT_NE(errors.str().find(file + ":8: steps[2]: var/mobile/nothing.plist does not exist"),
+  EXPECT_NE(errors.str().find(file + ":5: steps[2]: var/mobile/nothing.plist does not exist"),
             std::string::npos)
       << errors.str();
   EXPECT_EQ(countLines(out.str(), "\"outcome\":\"ok\""), 2u) << out.str();

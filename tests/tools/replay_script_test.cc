@@ -22,19 +22,11 @@ struct MalformedScript {
 TEST(ReplayScriptTest, MalformedScriptsAreRefusedNamingLineStepAndField) {
   const MalformedScript cases[] = {
       {"malformed YAML", "steps:\n  - advance: 1s\n  - call: [a\n", ":4: not valid YAML"},
-      {"no steps", "device: {}\n", ":1: the field \"steps\" is missing"},
-      {"steps not a list", "steps: {advance: 1s}\n", ":1: steps: expected a list"},
       {"step not a mapping", "steps:\n  - advance\n", ":2: steps[0]: a step is a mapping"},
       {"unknown action", "steps:\n  - advance: 1s\n  - jump: 3\n",
        ":3: steps[1].jump: unknown action \"jump\""},
       {"two actions", "steps:\n  - advance: 1s\n    expect: todo\n",
        ":3: steps[0].expect: a step has one action, and this one already has \"advance\""},
-      {"duration of the wrong type", "steps:\n  - advance: soon\n",
-       ":2: steps[0].advance: expected a duration"},
-      {"unknown field of an engine action", "steps:\n  - advance: 1s\n    times: 2\n",
-       ":3: steps[0].times: unknown field \"times\""},
-      {"background name of the wrong type", "steps:\n  - call: x\n    background: [a]\n",
-       ":3: steps[0].background: expected a text"},
       {"background on an engine action", "steps:\n  - advance: 1s\n    background: b\n",
        ":3: steps[0].background: only call, plugin, event, stage and platform"},
       {"background name still running",
@@ -42,12 +34,8 @@ TEST(ReplayScriptTest, MalformedScriptsAreRefusedNamingLineStepAndField) {
        ":5: steps[1].background: \"b\" is still running"},
       {"result on a background step", "steps:\n  - call: x\n    background: b\n    result: 1\n",
        ":4: steps[0].result: a background step's result is checked by the step that awaits it"},
-      {"await of an unknown name", "steps:\n  - call: x\n    background: b\n  - await: c\n",
-       ":4: steps[1].await: no step started \"c\""},
       {"await twice", "steps:\n  - call: x\n    background: b\n  - await: b\n  - await: b\n",
        ":5: steps[2].await: no step started \"b\""},
-      {"result not a property list", "steps:\n  - call: x\n    result: [1, ~]\n",
-       ":3: steps[0].result[1]: a property list has no null"},
       {"unknown expectation", "steps:\n  - expect: weather\n",
        ":2: steps[0].expect: unknown expectation \"weather\""},
       {"field of another expectation", "steps:\n  - expect: todo\n    app: a\n    path: x\n",
@@ -56,10 +44,6 @@ TEST(ReplayScriptTest, MalformedScriptsAreRefusedNamingLineStepAndField) {
        "steps:\n  - expect: todo\n    app: a\n    state: SENT\n"
        "    absent: true\n",
        ":2: steps[0]: the expectation takes only one of state or absent"},
-      {"absent not a boolean", "steps:\n  - expect: registry\n    app: a\n    absent: maybe\n",
-       ":4: steps[0].absent: expected true or false"},
-      {"log level", "steps:\n  - expect: log\n    text: hi\n    level: Loud\n",
-       ":4: steps[0].level: expected one of Default, Error"},
       {"absolute path", "steps:\n  - expect: file\n    path: /etc/passwd\n",
        ":3: steps[0].path: \"/etc/passwd\" is absolute"},
       {"path leaving the root", "steps:\n  - expect: file\n    path: var/../../x\n",
@@ -69,7 +53,7 @@ TEST(ReplayScriptTest, MalformedScriptsAreRefusedNamingLineStepAndField) {
        "steps:\n  - expect: file\n    path:\n    exists: true\n",
        ":3: steps[0].path: expected a text"},
       {"missing device file", "device: nowhere.yaml\nsteps: []\n",
-       "script.yaml:1: device: no description file at"},
+       ":1: device: no description file at"},
   };
   for (const MalformedScript& c : cases) {
     SCOPED_TRACE(c.name);
@@ -78,10 +62,9 @@ TEST(ReplayScriptTest, MalformedScriptsAreRefusedNamingLineStepAndField) {
     testing::writeText(script, c.text);
     const std::filesystem::path root = dir.path() / "device";
     std::ostringstream out, errors;
-    const int status = host::replay::replay({.script = script, .root = root}, out, errors);
-    EXPECT_EQ(status, host::kExitBadInput);
-    const std::string file = c.message[0] == ':' ? script.string() : "";
-    EXPECT_NE(errors.str().find(file + c.message), std::string::npos) << errors.str();
+    EXPECT_EQ(host::replay::replay({.script = script, .root = root}, out, errors),
+              host::kExitBadInput);
+    EXPECT_NE(errors.str().find(script.string() + c.message), std::string::npos) << errors.str();
     EXPECT_EQ(out.str(), "");
     EXPECT_FALSE(std::filesystem::exists(root));
   }

@@ -1,5 +1,5 @@
 // appsync-host show: the device gathered as JSON (every service's state, property lists with
-// data and dates), the tables a person reads, and the command run against a saved device.
+// data and dates) and as the tables a person reads, run against a device saved by another process.
 #include <gtest/gtest.h>
 
 #include <cstdint>
@@ -35,18 +35,16 @@ TEST(PlistToJsonTest, EveryTypeHasItsJsonForm) {
     plist::Value value;
     json expected;
   } cases[] = {
-      {"boolean", true, true},
       {"negative integer", std::int64_t{-5}, -5},
       {"integer above INT64_MAX", std::numeric_limits<std::uint64_t>::max(),
        std::numeric_limits<std::uint64_t>::max()},
-      {"real", 2.5, 2.5},
-      {"string", "text", "text"},
       {"data", plist::Bytes{0x00, 0xff, 0x10}, {{"data", "AP8Q"}}},
       {"date", plist::Date{0}, {{"date", "2001-01-01T00:00:00Z"}}},
       {"date outside years 0001-9999", plist::Date{1e300}, {{"date", 1e300}}},
       {"uid", plist::Uid{3}, {{"uid", 3}}},
-      {"nested", plist::Array{plist::Dict{{"a", plist::Array{1, "x"}}}},
-       json::array({{{"a", json::array({1, "x"})}}})},
+      {"nested, with a boolean, a real and a string",
+       plist::Array{plist::Dict{{"a", plist::Array{1, "x", true, 2.5}}}},
+       json::array({{{"a", json::array({1, "x", true, 2.5})}}})},
       {"null", plist::Value::null(), nullptr},
   };
   for (const auto& c : cases) {
@@ -66,13 +64,9 @@ TEST(LastLinesOfFileTest, KeepsOnlyTheLastLines) {
     std::size_t count;
     std::vector<std::string> expected;
   } cases[] = {
-      {nullptr, 3, {}},
-      {"", 3, {}},
-      {"a\nb\nc\n", 2, {"b", "c"}},
-      {"a\nb\nc", 2, {"b", "c"}},
-      {"a\nb\n", 5, {"a", "b"}},
-      {"a\nb\n", 0, {}},
-      {big.c_str(), 2, {"line 19998", "line 19999"}},
+      {nullptr, 3, {}},           {"a\nb\nc\n", 2, {"b", "c"}},
+      {"a\nb\nc", 2, {"b", "c"}}, {"a\nb\n", 5, {"a", "b"}},
+      {"a\nb\n", 0, {}},          {big.c_str(), 2, {"line 19998", "line 19999"}},
   };
   for (const auto& c : cases) {
     const auto path = dir.path() / "log.txt";
@@ -82,97 +76,6 @@ TEST(LastLinesOfFileTest, KeepsOnlyTheLastLines) {
   }
 }
 
-// A device with something in every service.
-class ShowViewTest : public ::testing::Test {
- protected:
-  ShowViewTest() : device_(dir_.path(), {.coordination = true}) {
-    device_.ar().putApplication(
-        {.identifier = "com.a", .version = "1.0", .name = "Alpha", .staticDiskUsage = 4096});
-    device_.ar().putApplication(
-        {.identifier = "com.b", .version = "2.0", .name = "Beta", .isPlaceholder = true});
-    device_.ar().putApplication({.identifier = "com.plugin", .isApplication = false});
-    device_.em().addUninstalled("com.gone");
-    device_.rs().setValue(RSFeatureAppRemovalAllowed, RSRestrictedBoolExplicitNo);
-    int token = 0;
-    device_.system().notifyRegisterCheck(kSyncNotificationName, &token);
-    device_.system().notifySetState(token, 1);
-    device_.system().notifyPost(kSyncNotificationName);
-    const plist::Bytes layout = *plist::writeBinary(
-        plist::Dict{{"iconLists", plist::Array{plist::Value(plist::Array{"com.a"})}},
-                    {"badge", plist::Bytes{0xde, 0xad}}});
-    device_.pv().PVSetIconState(device_.pv().PVSPavilionBlockableServerPort(), layout.data(),
-                                layout.size());
-    device_.transactionLog().logStep(1, 1, 1, true, "com.a", "first");
-    device_.transactionLog().logStep(2, 1, 1, true, "com.a", "second");
-    device_.transactionLog().logScenario("Asset install", 3, false, "com.b", "third");
-    writeText(logFile(), "one\ntwo\nthree\n");
-  }
-
-  std::filesystem::path logFile() const { return dir_.path() / "appsync.log"; }
-  json collect() { return collectDevice(device_, logFile(), 2); }
-  // A file of the device, with the directories on its way.
-  static void put(const std::string& path, const std::string& text) {
-    std::filesystem::create_directories(std::filesystem::path(path).parent_path());
-    writeText(path, text);
-  }
-  static void writePlist(const std::string& path, const plist::Value& value) {
-    const plist::Bytes bytes = *plist::writeBinary(value);
-    put(path, std::string(bytes.begin(), bytes.end()));
-  }
-
-  testing::TempDir dir_;
-  FakePlatform device_;
-};
-
-TEST_F(ShowViewTest, GathersEveryService) {
-  writePlist(device_.paths().restoreState(),
-             plist::Dict{{"com.b", plist::Dict{{"2.0", plist::Dict{{"path", "/x/B.zip"}}}}}});
-  const json view = collect();
-
-  std::vector<std::string> kinds;
-  for (const json& app : view["registry"]) kinds.push_back(app["kind"]);
-  EXPECT_EQ(kinds, (std::vector<std::string>{"installed", "placeholder", "bundle"}));
-  EXPECT_EQ(view["restore"]["state"]["com.b"]["2.0"]["path"], "/x/B.zip");
-  EXPECT_EQ(view["restore"]["listWaiting"], false);
-  EXPECT_EQ(view["homeScreen"]["syncNotificationState"], 1);
-  EXPECT_EQ(view["homeScreen"]["syncNotificationPosts"], 1);
-  EXPECT_EQ(
-      view["homeScreen"]["iconState"],
-      (json{{"iconLists", json::array({json::array({"com.a"})})}, {"badge", {{"data", "3q0="}}}}));
-  EXPECT_EQ(view["installer"]["uninstalled"], json::array({"com.gone"}));
-  EXPECT_EQ(view["restrictions"],
-            (json{{"allowAppInstallation", "unset"}, {"allowAppRemoval", "no"}}));
-  EXPECT_EQ(view["log"]["lines"], json::array({"two", "three"}));
-  ASSERT_EQ(view["transactions"].size(), 2u);
-  EXPECT_EQ(view["transactions"][0]["description"], "second");
-  EXPECT_EQ(view["transactions"][1]["scenario"], "Asset install");
-  EXPECT_EQ(json::parse(view.dump()), view);
-}
-
-TEST_F(ShowViewTest, CoordinatorsWithTheirPlaceholderAndPromises) {
-  FakeKCInstallCoordination& kc = device_.kc();
-  kc.hold();  // the placeholder stays uninstalled while the view is taken
-  auto coordinator = kc.putCoordinator(KCCoordinatorKind::Restoring, "com.b", 7);
-  auto placeholder = kc.initAppPlaceholder("Beta", "com.b", 1, 7);
-  ASSERT_TRUE(placeholder->setConfigurationCompleteWithError(nullptr));
-  ASSERT_TRUE(coordinator->setPlaceholderPromise(placeholder, nullptr));
-  auto asset = kc.initPromisedTransferToPath("asset", 1, "/staging/B.zip", 100);
-  asset->setPercentComplete(0.25);
-  ASSERT_TRUE(coordinator->setAppAssetPromise(asset, nullptr));
-
-  const json view = collect();
-  ASSERT_EQ(view["coordinators"].size(), 1u);
-  const json& c = view["coordinators"][0];
-  EXPECT_EQ(c["kind"], "Restoring");
-  EXPECT_EQ(c["placeholder"]["configurationComplete"], true);
-  ASSERT_EQ(c["promises"].size(), 1u);
-  EXPECT_EQ(c["promises"][0]["role"], "asset");
-  EXPECT_EQ(c["promises"][0]["transferPath"], "/staging/B.zip");
-  EXPECT_EQ(c["promises"][0]["percentComplete"], 0.25);
-  EXPECT_NE(renderDeviceTable(view, false).find("25%"), std::string::npos);
-  kc.release();
-}
-
 // The line of the table that starts (after its indent) with `first`.
 std::string rowOf(const std::string& table, const std::string& first) {
   const std::size_t at = table.find("\n  " + first + " ");
@@ -180,73 +83,63 @@ std::string rowOf(const std::string& table, const std::string& first) {
   return table.substr(at + 1, table.find('\n', at + 1) - at - 1);
 }
 
-TEST_F(ShowViewTest, FinishedCoordinatorsAreListedWithTheirOutcome) {
-  FakeKCInstallCoordination& kc = device_.kc();
-  EXPECT_EQ(renderDeviceTable(collect(), false).find("Finished coordinators"), std::string::npos);
-  kc.putCoordinator(KCCoordinatorKind::Updating, "com.c", 7)
-      ->cancelForReason(makeError("Test", 5, "no"), 1, nullptr);
-  kc.putCoordinator(KCCoordinatorKind::Restoring, "com.d", 7)->cancelForReason(nullptr, 0, nullptr);
-  kc.drain();
-
-  const json view = collect();
-  EXPECT_EQ(view["finishedCoordinators"],
-            json::parse(R"([{"bundleID": "com.c", "kind": "Updating", "state": "cancelled",
-                             "errorDomain": "Test", "errorCode": 5, "cancellingClient": 1},
-                            {"bundleID": "com.d", "kind": "Restoring", "state": "cancelled",
-                             "errorDomain": "KCErrorDomain", "errorCode": 10,
-                             "cancellingClient": 0}])"));
-  const std::string table = renderDeviceTable(view, false);
-  EXPECT_NE(table.find("Finished coordinators (2)"), std::string::npos) << table;
-  EXPECT_NE(rowOf(table, "com.c").find(" Updating "), std::string::npos) << table;
-  EXPECT_NE(rowOf(table, "com.c").find(" cancelled  Test 5 "), std::string::npos) << table;
-}
-
-TEST_F(ShowViewTest, AnUnusableTodoListIsReportedNotLogged) {
+TEST(ShowViewTest, AnUnusableTodoListIsReportedNotLogged) {
+  testing::TempDir dir;
+  FakePlatform device(dir.path());
+  std::filesystem::create_directories(
+      std::filesystem::path(device.paths().todoList()).parent_path());
   for (const char* text : {"<plist><array><string>broken", "<plist><dict/></plist>"}) {
-    put(device_.paths().todoList(), text);
-    const json view = collect();
+    writeText(device.paths().todoList(), text);
+    const json view = collectDevice(device, dir.path() / "appsync.log", 2);
     EXPECT_EQ(view["todoList"]["present"], false) << text;
     EXPECT_TRUE(view["todoList"]["error"].is_string()) << text;
     EXPECT_NE(renderDeviceTable(view, false).find("unreadable"), std::string::npos) << text;
   }
-  EXPECT_TRUE(device_.log().lines().empty());
+  EXPECT_TRUE(device.log().lines().empty());
 }
 
-TEST_F(ShowViewTest, TablesAreAlignedAndPlainUnlessStyled) {
-  const std::string table = renderDeviceTable(collect(), false);
-  const std::string installed = rowOf(table, "com.a");
-  const std::string placeholder = rowOf(table, "com.b");
-  EXPECT_NE(installed.find(" installed "), std::string::npos) << table;
-  EXPECT_NE(placeholder.find(" placeholder "), std::string::npos) << table;
-  // Every registry row has its kind where the heading has KIND.
-  const std::string heading = rowOf(table, "IDENTIFIER");
-  EXPECT_EQ(installed.find("installed"), heading.find("KIND")) << table;
-  EXPECT_EQ(placeholder.find("placeholder"), heading.find("KIND")) << table;
-  EXPECT_EQ(table.find('\033'), std::string::npos);
-  EXPECT_NE(renderDeviceTable(collect(), true).find("\033[1m"), std::string::npos);
+// Something in every service.
+void fillDevice(FakePlatform& device) {
+  device.ar().putApplication(
+      {.identifier = "com.a", .version = "1.0", .name = "Alpha", .staticDiskUsage = 4096});
+  device.ar().putApplication(
+      {.identifier = "com.b", .version = "2.0", .name = "Beta", .isPlaceholder = true});
+  device.ar().putApplication({.identifier = "com.plugin", .isApplication = false});
+  device.rs().setValue(RSFeatureAppRemovalAllowed, RSRestrictedBoolExplicitNo);
+  const plist::Bytes layout = *plist::writeBinary(
+      plist::Dict{{"iconLists", plist::Array{plist::Value(plist::Array{"com.a"})}},
+                  {"badge", plist::Bytes{0xde, 0xad}}});
+  device.pv().PVSetIconState(device.pv().PVSPavilionBlockableServerPort(), layout.data(),
+                             layout.size());
+  device.transactionLog().logStep(1, 1, 1, true, "com.a", "first");
+  device.transactionLog().logStep(2, 1, 1, true, "com.a", "second");
+  device.transactionLog().logScenario("Asset install", 3, false, "com.b", "third");
+  FakeKCInstallCoordination& kc = device.kc();
+  kc.putCoordinator(KCCoordinatorKind::Updating, "com.c", 7)
+      ->cancelForReason(makeError("Test", 5, "no"), 1, nullptr);
+  auto asset = kc.initPromisedTransferToPath("asset", 1, "/staging/B.zip", 100);
+  asset->setPercentComplete(0.25);
+  kc.putCoordinator(KCCoordinatorKind::Restoring, "com.b", 7)->setAppAssetPromise(asset, nullptr);
+  kc.drain();
 }
 
 // Every saved state file under `directory` with its bytes (the lock file names its holder).
 std::map<std::string, std::string> filesUnder(const std::filesystem::path& directory) {
   std::map<std::string, std::string> files;
   for (const auto& entry : std::filesystem::directory_iterator(directory)) {
-    if (entry.path().extension() == ".plist") {
-      files[entry.path().string()] = testing::readText(entry.path());
-    }
+    if (entry.path().extension() == ".plist") files[entry.path()] = testing::readText(entry.path());
   }
   return files;
 }
 
-TEST(ShowCommandTest, ShowsADeviceSavedByAnotherProcessAndChangesNothing) {
+TEST(ShowCommandTest, ShowsEveryServiceOfASavedDeviceAndChangesNothing) {
   const char* host = std::getenv("APPSYNC_HOST");
-  ASSERT_NE(host, nullptr) << "APPSYNC_HOST is not set";
+  ASSERT_NE(host, nullptr) << "APPSYNC_HOST is set by the build";
   testing::TempDir dir;
   const auto root = dir.path() / "device";
   {
     auto session = DeviceSession::create(root, {.coordination = true});
-    session->device().ar().putApplication({.identifier = "com.a", .version = "1.0"});
-    session->device().ar().putApplication({.identifier = "com.b", .isPlaceholder = true});
-    session->device().em().addUninstalled("com.gone");
+    fillDevice(session->device());
     session->close();
   }
   const auto show = [&](const std::string& arguments) {
@@ -255,19 +148,37 @@ TEST(ShowCommandTest, ShowsADeviceSavedByAnotherProcessAndChangesNothing) {
   const auto before = filesUnder(DeviceSession::stateDirectory(root));
   ASSERT_FALSE(before.empty());
 
-  const testing::HostRun asJson = show("--json");
+  const testing::HostRun asJson = show("--json --lines 2");
   ASSERT_EQ(asJson.status, 0) << asJson.stderrText;
   const json view = json::parse(asJson.stdoutText);
-  ASSERT_EQ(view["registry"].size(), 2u);
-  EXPECT_EQ(view["registry"][0]["kind"], "installed");
-  EXPECT_EQ(view["registry"][1]["kind"], "placeholder");
-  EXPECT_EQ(view["installer"]["uninstalled"], json::array({"com.gone"}));
+  std::vector<std::string> kinds;
+  for (const json& app : view["registry"]) kinds.push_back(app["kind"]);
+  EXPECT_EQ(kinds, (std::vector<std::string>{"installed", "placeholder", "bundle"}));
+  EXPECT_EQ(
+      view["homeScreen"]["iconState"],
+      (json{{"iconLists", json::array({json::array({"com.a"})})}, {"badge", {{"data", "3q0="}}}}));
+  EXPECT_EQ(view["restrictions"],
+            (json{{"allowAppInstallation", "unset"}, {"allowAppRemoval", "no"}}));
+  ASSERT_EQ(view["transactions"].size(), 2u);
+  EXPECT_EQ(view["transactions"][0]["description"], "second");
+  EXPECT_EQ(view["transactions"][1]["scenario"], "Asset install");
+  ASSERT_EQ(view["coordinators"].size(), 1u);
+  EXPECT_EQ(view["coordinators"][0]["kind"], "Restoring");
+  EXPECT_EQ(view["finishedCoordinators"],
+            json::parse(R"([{"bundleID": "com.c", "kind": "Updating", "state": "cancelled",
+                             "errorDomain": "Test", "errorCode": 5, "cancellingClient": 1}])"));
+  EXPECT_NE(renderDeviceTable(view, true).find("\033[1m"), std::string::npos);
 
-  const testing::HostRun asTable = show("--lines 3");
+  // Every registry row has its kind where the heading has KIND; no styling off a terminal.
+  const testing::HostRun asTable = show("");
   ASSERT_EQ(asTable.status, 0) << asTable.stderrText;
-  EXPECT_NE(rowOf(asTable.stdoutText, "com.b").find(" placeholder "), std::string::npos)
-      << asTable.stdoutText;
-  EXPECT_EQ(asTable.stdoutText.find('\033'), std::string::npos);
+  const std::string& table = asTable.stdoutText;
+  const std::string heading = rowOf(table, "IDENTIFIER");
+  EXPECT_EQ(rowOf(table, "com.a").find(" installed "), heading.find("KIND") - 1) << table;
+  EXPECT_EQ(rowOf(table, "com.b").find(" placeholder "), heading.find("KIND") - 1) << table;
+  EXPECT_NE(table.find("25%"), std::string::npos) << table;
+  EXPECT_NE(rowOf(table, "com.c").find(" cancelled  Test 5 "), std::string::npos) << table;
+  EXPECT_EQ(table.find('\033'), std::string::npos);
   EXPECT_EQ(filesUnder(DeviceSession::stateDirectory(root)), before);
 
   {

@@ -25,8 +25,6 @@ class Observer : public ARApplicationWorkspaceObserverProtocol {
     ++calls;
   }
   void applicationInstallsDidCancel(const ARProxyList&) override { ++calls; }
-  void applicationsDidInstall(const ARProxyList&) override { ++calls; }
-  void applicationsDidUninstall(const ARProxyList&) override { ++calls; }
   const std::thread::id caller = std::this_thread::get_id();
   std::atomic<bool> blocking{false}, onCallerThread{false};
   std::promise<void> entered, letGo;

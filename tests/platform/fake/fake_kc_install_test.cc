@@ -25,10 +25,6 @@ std::string packageInfo(const std::string& id, const std::string& version) {
                                       {std::string(kBNBundleVersionKey), version}});
 }
 
-std::shared_ptr<const EMStoreMetadata> metadata(const std::optional<plist::Dict>& dict) {
-  return dict ? std::make_shared<EMStoreMetadata>(*dict) : nullptr;
-}
-
 class FakeKCInstallTest : public ::testing::Test {
  protected:
   // A coordinator of `id` whose placeholder carries `placeholderMetadata` and `sinf`, without
@@ -42,15 +38,14 @@ class FakeKCInstallTest : public ::testing::Test {
     KCPlaceholderAttributes attributes;
     attributes.setBundleVersion("1.0");
     placeholder->setPlaceholderAttributes(attributes, nullptr);
-    placeholder->setMetadata(metadata(placeholderMetadata), nullptr);
+    if (placeholderMetadata) {
+      placeholder->setMetadata(std::make_shared<EMStoreMetadata>(*placeholderMetadata), nullptr);
+    }
     if (sinf) placeholder->setSinfData(*sinf, nullptr);
     placeholder->setConfigurationCompleteWithError(nullptr);
     c->setPlaceholderPromise(placeholder, nullptr);
     c->setAppAssetPromise(kc.initPromisedTransferToPath("asset", kOurClient, package, 0), nullptr);
     return c;
-  }
-  static void deliver(const Coordinator& c) {
-    c->appAssetPromiseWithError(nullptr)->setComplete(true);
   }
 
   testing::TempDir root, packages;
@@ -84,9 +79,8 @@ TEST_F(FakeKCInstallTest, TheInstallCarriesMetadataAndSINFIntoTheRegistry) {
     auto placeholder = registry.application("com.game");
     ASSERT_TRUE(placeholder && placeholder->isPlaceholder);
     EXPECT_EQ(placeholder->hasMIDBasedSINF, c.marked);
-    EXPECT_EQ(placeholder->version, "1.0");
 
-    deliver(game);
+    game->appAssetPromiseWithError(nullptr)->setComplete(true);
     kc.drain();
     auto installed = registry.application("com.game");
     ASSERT_TRUE(installed && !installed->isPlaceholder);
@@ -105,19 +99,6 @@ TEST_F(FakeKCInstallTest, TheInstallCarriesMetadataAndSINFIntoTheRegistry) {
   }
 }
 
-// Reads what the service remembers of a coordinator when its last event arrives.
-class OutcomeAtEvent : public KCAppInstallObserverDelegate {
- public:
-  explicit OutcomeAtEvent(FakeKCInstallCoordination& kc) : kc_(kc) {}
-  void coordinatorDidCompleteSuccessfully(const Coordinator& c) override { read(c); }
-  void coordinator(const Coordinator& c, const ErrorRef&, std::uint64_t) override { read(c); }
-  std::optional<FinishedCoordinator> seen;  // written on the service's thread, read after drain
-
- private:
-  void read(const Coordinator& c) { seen = kc_.finishedCoordinator(c->bundleID()); }
-  FakeKCInstallCoordination& kc_;
-};
-
 TEST_F(FakeKCInstallTest, AFinishedCoordinatorsOutcomeIsKept) {
   testing::writeZip(packages / "Game.zip", {{"Game.app/Info.plist", packageInfo("com.game", "1")}});
   const std::string good = packages / "Game.zip", missing = packages / "Missing.zip";
@@ -130,7 +111,9 @@ TEST_F(FakeKCInstallTest, AFinishedCoordinatorsOutcomeIsKept) {
   // An installed one and one a client cancelled are shown by the coordinated-install scenario.
   const Case cases[] = {
       {"the install failed",
-       [&] { deliver(coordinator("com.game", missing)); },
+       [&] {
+         coordinator("com.game", missing)->appAssetPromiseWithError(nullptr)->setComplete(true);
+       },
        {"com.game", KCCoordinatorKind::Initiating, State::Completed, domain,
         kKCErrorInstallFailed}},
       {"cancelled without a reason",
@@ -152,30 +135,6 @@ TEST_F(FakeKCInstallTest, AFinishedCoordinatorsOutcomeIsKept) {
     EXPECT_EQ(kc.finishedCoordinator("com.game"), c.expected);
     registry.uninstallApplication("com.game", std::nullopt);
   }
-}
-
-TEST_F(FakeKCInstallTest, ANewCoordinatorLeavesTheOutcomeUntilItFinishes) {
-  coordinator("com.game", packages / "Missing.zip")->cancelForReason(nullptr, kOurClient, nullptr);
-  Coordinator update = kc.coordinatorForAppWithBundleID(KCCoordinatorKind::Updating, "com.game",
-                                                        kOurClient, true, nullptr, nullptr);
-  kc.drain();
-  EXPECT_EQ(kc.finishedCoordinator("com.game")->state, State::Cancelled);
-  EXPECT_EQ(kc.finishedCoordinator("com.game")->kind, KCCoordinatorKind::Initiating);
-
-  OutcomeAtEvent observer(kc);
-  update->setObserver(&observer);
-  testing::writeZip(packages / "Game.zip", {{"Game.app/Info.plist", packageInfo("com.game", "2")}});
-  auto placeholder = kc.initAppPlaceholder("Game", "com.game", ARInstallTypeSync, kOurClient);
-  placeholder->setConfigurationCompleteWithError(nullptr);
-  update->setPlaceholderPromise(placeholder, nullptr);
-  update->setAppAssetPromise(
-      kc.initPromisedTransferToPath("asset", kOurClient, packages / "Game.zip", 0), nullptr);
-  deliver(update);
-  kc.drain();
-  const FinishedCoordinator done{"com.game", KCCoordinatorKind::Updating, State::Completed};
-  EXPECT_EQ(kc.finishedCoordinator("com.game"), done);
-  EXPECT_EQ(observer.seen, done) << "recorded before the event";
-  kc.removeObserver(&observer);
 }
 
 TEST_F(FakeKCInstallTest, TheOldestOutcomesAreDroppedBeyondTheBound) {

@@ -1,103 +1,25 @@
-// Test fixtures for the icon renderer: PNG files of every kind written with libpng directly,
-// PNG files assembled chunk by chunk (for damaged ones), and application bundles on disk.
+// Test fixtures for the icon renderer: PNG files assembled chunk by chunk (of every kind, and
+// damaged ones), and application bundles on disk.
 #pragma once
 
+#include <gtest/gtest.h>
 #include <png.h>
 #include <zlib.h>
 
-#include <csetjmp>
+#include <algorithm>
 #include <cstdint>
 #include <cstring>
 #include <filesystem>
-#include <fstream>
 #include <string>
-#include <utility>
 #include <vector>
 
 #include "platform/icon/image.h"
 #include "platform/icon/png_codec.h"
+#include "runtime/fs/files.h"
 
 namespace appsync::testing {
 
 using Bytes = std::vector<std::uint8_t>;
-
-// A PNG described as it is stored: rows of packed samples (big-endian at 16 bits).
-struct RawPng {
-  int width = 0;
-  int height = 0;
-  int bitDepth = 8;
-  int colorType = PNG_COLOR_TYPE_RGB_ALPHA;
-  bool interlaced = false;
-  std::vector<Bytes> rows;
-  std::vector<png_color> palette;
-  Bytes paletteAlpha;                // tRNS of a palette image
-  bool hasTransparentColor = false;  // tRNS of a gray or RGB image
-  png_color_16 transparentColor{};
-};
-
-namespace detail {
-
-inline void appendBytes(png_structp png, png_bytep data, std::size_t n) {
-  auto* out = static_cast<Bytes*>(png_get_io_ptr(png));
-  out->insert(out->end(), data, data + n);
-}
-
-// Left by longjmp on a libpng error; holds nothing with a destructor.
-inline bool writeRaw(png_structp png, png_infop info, const RawPng* raw, png_bytepp rows) {
-  if (setjmp(png_jmpbuf(png))) return false;
-  png_set_IHDR(png, info, raw->width, raw->height, raw->bitDepth, raw->colorType,
-               raw->interlaced ? PNG_INTERLACE_ADAM7 : PNG_INTERLACE_NONE,
-               PNG_COMPRESSION_TYPE_DEFAULT, PNG_FILTER_TYPE_DEFAULT);
-  if (!raw->palette.empty()) {
-    png_set_PLTE(png, info, raw->palette.data(), static_cast<int>(raw->palette.size()));
-  }
-  if (!raw->paletteAlpha.empty()) {
-    png_set_tRNS(png, info, raw->paletteAlpha.data(), static_cast<int>(raw->paletteAlpha.size()),
-                 nullptr);
-  }
-  if (raw->hasTransparentColor) png_set_tRNS(png, info, nullptr, 0, &raw->transparentColor);
-  png_write_info(png, info);
-  if (raw->interlaced) png_set_interlace_handling(png);
-  png_write_image(png, rows);
-  png_write_end(png, nullptr);
-  return true;
-}
-
-}  // namespace detail
-
-inline Bytes writeRawPng(const RawPng& raw) {
-  Bytes out;
-  png_structp png = png_create_write_struct(PNG_LIBPNG_VER_STRING, nullptr, nullptr, nullptr);
-  png_infop info = png_create_info_struct(png);
-  png_set_write_fn(png, &out, detail::appendBytes, nullptr);
-  std::vector<png_bytep> rows;
-  for (const Bytes& row : raw.rows) rows.push_back(const_cast<png_bytep>(row.data()));
-  const bool ok = detail::writeRaw(png, info, &raw, rows.data());
-  png_destroy_write_struct(&png, &info);
-  return ok ? out : Bytes{};
-}
-
-// Packs samples of `depth` bits into a PNG row (most significant bits first; 16-bit big-endian).
-inline Bytes packSamples(const std::vector<unsigned>& samples, int depth) {
-  Bytes row;
-  if (depth == 16) {
-    for (unsigned s : samples) {
-      row.push_back(static_cast<std::uint8_t>(s >> 8));
-      row.push_back(static_cast<std::uint8_t>(s & 0xff));
-    }
-    return row;
-  }
-  const int perByte = 8 / depth;
-  for (std::size_t i = 0; i < samples.size(); i += perByte) {
-    unsigned byte = 0;
-    for (int k = 0; k < perByte; ++k) {
-      const unsigned s = i + k < samples.size() ? samples[i + k] : 0;
-      byte |= s << (8 - depth * (k + 1));
-    }
-    row.push_back(static_cast<std::uint8_t>(byte));
-  }
-  return row;
-}
 
 // Chunk-level assembly.
 inline void appendBigEndian32(Bytes& out, std::uint32_t v) {
@@ -116,15 +38,12 @@ inline Bytes chunk(const std::string& type, const Bytes& data) {
 }
 
 inline Bytes ihdr(std::uint32_t width, std::uint32_t height, int depth, int colorType,
-                  int interlace = 0) {
+                  bool interlaced = false) {
   Bytes data;
   appendBigEndian32(data, width);
   appendBigEndian32(data, height);
-  data.push_back(static_cast<std::uint8_t>(depth));
-  data.push_back(static_cast<std::uint8_t>(colorType));
-  data.push_back(0);
-  data.push_back(0);
-  data.push_back(static_cast<std::uint8_t>(interlace));
+  data.insert(data.end(), {static_cast<std::uint8_t>(depth), static_cast<std::uint8_t>(colorType),
+                           0, 0, static_cast<std::uint8_t>(interlaced)});
   return chunk("IHDR", data);
 }
 
@@ -155,37 +74,28 @@ inline std::size_t findChunk(const Bytes& png, const std::string& type) {
   return 0;
 }
 
-// A size x size image of one colour.
-inline icon::Image solidImage(int width, int height, std::uint8_t r, std::uint8_t g, std::uint8_t b,
-                              std::uint8_t a = 255) {
+// An opaque image of one colour.
+inline icon::Image solidImage(int width, int height, std::uint8_t r, std::uint8_t g,
+                              std::uint8_t b) {
   icon::Image image(width, height);
   for (std::size_t i = 0; i < image.rgba.size(); i += 4) {
-    image.rgba[i] = r;
-    image.rgba[i + 1] = g;
-    image.rgba[i + 2] = b;
-    image.rgba[i + 3] = a;
+    const std::uint8_t pixel[] = {r, g, b, 255};
+    std::copy_n(pixel, 4, &image.rgba[i]);
   }
   return image;
 }
 
-inline Bytes solidPng(int width, int height, std::uint8_t r = 200, std::uint8_t g = 40,
-                      std::uint8_t b = 90) {
-  return *icon::encodePng(solidImage(width, height, r, g, b));
+inline Bytes solidPng(int width, int height) {
+  return *icon::encodePng(solidImage(width, height, 200, 40, 90));
 }
 
 inline void writeBytes(const std::filesystem::path& path, const Bytes& bytes) {
-  std::filesystem::create_directories(path.parent_path());
-  std::ofstream out(path, std::ios::binary | std::ios::trunc);
-  out.write(reinterpret_cast<const char*>(bytes.data()),
-            static_cast<std::streamsize>(bytes.size()));
+  ASSERT_TRUE(writeFileAtomically(path.string(), bytes)) << path;
 }
 
 // Writes `dict` (the inside of a <dict> element) as the bundle's Info.plist, in XML.
 inline void writeInfoPlist(const std::filesystem::path& bundle, const std::string& dict) {
-  const std::string text =
-      "<?xml version=\"1.0\" encoding=\"UTF-8\"?>\n"
-      "<plist version=\"1.0\">\n<dict>\n" +
-      dict + "\n</dict>\n</plist>\n";
+  const std::string text = "<plist version=\"1.0\"><dict>" + dict + "</dict></plist>";
   writeBytes(bundle / "Info.plist", Bytes(text.begin(), text.end()));
 }
 
