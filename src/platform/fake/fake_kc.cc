@@ -196,6 +196,14 @@ bool FakeKCInstallCoordination::completeStoreDownload(const std::string& bundleI
   return true;
 }
 
+void FakeKCInstallCoordination::holdPlaceholderInstall(const std::string& bundleID) {
+  daemon_->holdPlaceholderInstall(bundleID);
+}
+
+bool FakeKCInstallCoordination::releasePlaceholderInstall(const std::string& bundleID) {
+  return daemon_->releasePlaceholderInstall(bundleID);
+}
+
 bool FakeKCInstallCoordination::requestPrioritize(const std::string& bundleID) {
   std::shared_ptr<FakeKCAppInstallCoordinator> c = daemon_->find(bundleID);
   if (!c) return false;

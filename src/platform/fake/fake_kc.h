@@ -9,7 +9,8 @@
 //     or else the Info.plist's BNBundleVersion, install type from the placeholder, icon path from
 //     the icon promise, hasMIDBasedSINF when the placeholder has non-empty SINF bytes). A registry
 //     application that is not a placeholder (an update) is left as it is.
-//     coordinatorDidInstallPlaceholder follows.
+//     coordinatorDidInstallPlaceholder follows. A placeholder install held back by
+//     holdPlaceholderInstall waits for its release.
 //   - Once the placeholder is installed, the asset promise is complete with a transfer path and
 //     any user-data and SPR promises are complete, the package is installed:
 //     installApplication(path, {"PackageType": "Customer", "BNBundleIdentifier": ID,
@@ -149,6 +150,12 @@ class FakeKCInstallCoordination final : public KCInstallCoordination, public Fak
   // (made if missing) gets the path and is completed. False when there is no such active
   // coordinator.
   bool completeStoreDownload(const std::string& bundleID, const std::string& packagePath);
+  // Holds back the placeholder install of `bundleID`, as a service busy with it would: its
+  // coordinators keep their placeholder uninstalled (no coordinatorDidInstallPlaceholder, no
+  // package install) until releasePlaceholderInstall, which lets them go on as usual and is
+  // false when the install was not held. Not saved state: a hold ends with the service.
+  void holdPlaceholderInstall(const std::string& bundleID);
+  bool releasePlaceholderInstall(const std::string& bundleID);
   // Delivers coordinatorShouldPrioritize; false when no coordinator exists for the bundle.
   bool requestPrioritize(const std::string& bundleID);
   // Delivers promiseDidBeginFulfillmentWithIdentifier to the observers of the coordinator that

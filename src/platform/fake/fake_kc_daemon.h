@@ -10,6 +10,7 @@
 #include <memory>
 #include <mutex>
 #include <optional>
+#include <set>
 #include <string>
 #include <string_view>
 #include <vector>
@@ -71,6 +72,12 @@ class FakeKCDaemon final : public FakeKCServiceHooks,
   void addRegistration(const FakeKCAppInstallObserver* registration);
   void removeObserverEverywhere(const KCAppInstallObserverDelegate* observer);
 
+  // --- Placeholder installs kept back ---
+  // While held, a coordinator of `bundleID` keeps its placeholder uninstalled (and so its
+  // package), however ready; releasing has it re-examined. Release is false when not held.
+  void holdPlaceholderInstall(const std::string& bundleID);
+  bool releasePlaceholderInstall(const std::string& bundleID);
+
   // --- Saved state ---
   // The identifier the next promise will get.
   std::uint64_t upcomingPromiseIdentifier() const;
@@ -100,6 +107,7 @@ class FakeKCDaemon final : public FakeKCServiceHooks,
   // records its outcome.
   void retire(const CoordinatorRef& c, std::optional<std::uint64_t> cancellingClient);
   bool stopped() const;
+  bool placeholderInstallHeld(const std::string& bundleID) const;
   std::shared_ptr<CallbackThread> thread() const;
   // Returns once no delivery that may have read an old observer is running. Inside a delivery
   // the running one is the caller's own.
@@ -122,6 +130,7 @@ class FakeKCDaemon final : public FakeKCServiceHooks,
   std::vector<std::weak_ptr<Coordinator>> made_;  // every coordinator still alive
   std::vector<const FakeKCAppInstallObserver*> registrations_;
   std::uint64_t nextPromiseIdentifier_ = 1;
+  std::set<std::string> heldPlaceholderInstalls_;
   std::shared_ptr<CallbackThread> events_;
 };
 

@@ -1,6 +1,6 @@
 // The fake install-coordination daemon's installs: a coordinator's placeholder and then its
-// package go into the registry as its promises are fulfilled; a cancelled coordinator's
-// placeholder record comes out again; uninstalls.
+// package go into the registry as its promises are fulfilled, unless its placeholder install is
+// held back; a cancelled coordinator's placeholder record comes out again; uninstalls.
 #include "platform/fake/fake_kc_daemon.h"
 
 #include <optional>
@@ -37,7 +37,7 @@ void FakeKCDaemon::evaluate(const CoordinatorRef& c) {
   auto* placeholder = dynamic_cast<FakeKCPlaceholder*>(s.placeholder.get());
   if (!placeholder) return;
   if (!s.placeholderInstalled) {
-    if (!placeholder->isReadyToInstall()) return;
+    if (!placeholder->isReadyToInstall() || placeholderInstallHeld(c->bundleID())) return;
     if (ErrorRef failure = scriptedFailure(kInstallPlaceholderOp)) {
       if (c->markCancelled(failure)) {
         retire(c, kServiceClient);
@@ -85,6 +85,25 @@ void FakeKCDaemon::evaluate(const CoordinatorRef& c) {
   if (!c->finish(failure)) return;
   retire(c, std::nullopt);
   deliver(*c, [&](KCAppInstallObserverDelegate& d) { d.coordinatorDidCompleteSuccessfully(c); });
+}
+
+void FakeKCDaemon::holdPlaceholderInstall(const std::string& bundleID) {
+  std::lock_guard lock(mutex_);
+  heldPlaceholderInstalls_.insert(bundleID);
+}
+
+bool FakeKCDaemon::releasePlaceholderInstall(const std::string& bundleID) {
+  {
+    std::lock_guard lock(mutex_);
+    if (heldPlaceholderInstalls_.erase(bundleID) == 0) return false;
+  }
+  if (CoordinatorRef c = find(bundleID)) coordinatorChanged(c);
+  return true;
+}
+
+bool FakeKCDaemon::placeholderInstallHeld(const std::string& bundleID) const {
+  std::lock_guard lock(mutex_);
+  return heldPlaceholderInstalls_.count(bundleID) > 0;
 }
 
 void FakeKCDaemon::putPlaceholderRecord(Coordinator& c, const FakeKCPlaceholder& placeholder) {

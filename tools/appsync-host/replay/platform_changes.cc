@@ -1,7 +1,8 @@
 // `platform: KIND`: a change of the device's platform between the client's calls: scripted
 // failures of a service's operation (and their end), the home screen refusing termination
 // assertions, restrictions, the user installing or removing an app on the device, an install the
-// registry runs, and the data the backup holds for an app.
+// registry runs, the data the backup holds for an app, a placeholder install the coordination
+// service keeps back, and the operations the host's device service offers.
 #include <cstdint>
 #include <string>
 #include <vector>
@@ -10,6 +11,7 @@
 #include "platform/ar.h"
 #include "platform/pv.h"
 #include "platform/rs.h"
+#include "platform/tr.h"
 #include "replay/action_table.h"
 #include "replay/actions.h"
 #include "replay/install_progress_names.h"
@@ -176,6 +178,36 @@ ActionResult backupData(StepContext& s) {
   return std::nullopt;
 }
 
+// The coordination service keeps an app's placeholder uninstalled until released.
+ActionResult holdPlaceholder(StepContext& s) {
+  s.session.device().kc().holdPlaceholderInstall(s.step["app"].string());
+  return std::nullopt;
+}
+
+ActionResult releasePlaceholder(StepContext& s) {
+  const std::string app = s.step["app"].string();
+  if (!s.session.device().kc().releasePlaceholderInstall(app)) {
+    throw StepFailed("the placeholder install of " + app + " is not held");
+  }
+  return std::nullopt;
+}
+
+// Whether the host's device service offers an operation, as an older host may not.
+ActionResult hostOffers(StepContext& s) {
+  const YamlField field = s.step["operation"];
+  const std::string operation = field.string();
+  TRDeviceService::Operation which = TRDeviceService::Operation::prioritizeAsset;
+  if (operation == "cancelAssetTransferForFailedAsset:") {
+    which = TRDeviceService::Operation::cancelAssetTransferForFailedAsset;
+  } else if (operation != "prioritizeAsset:withCompletion:") {
+    field.fail("unknown operation \"" + operation +
+               "\" (expected one of: prioritizeAsset:withCompletion:, "
+               "cancelAssetTransferForFailedAsset:)");
+  }
+  s.session.device().tr().deviceService().setRespondsTo(which, s.step["offered"].boolean());
+  return std::nullopt;
+}
+
 const std::vector<ActionEntry>& platformTable() {
   static const std::vector<ActionEntry> table = {
       {"fail", {"service", "operation", "times", "error"}, scriptFailure},
@@ -186,6 +218,9 @@ const std::vector<ActionEntry>& platformTable() {
       {"remove-app", {"app"}, removeApp},
       {"backup-data", {"app", "size"}, backupData},
       {"install-progress", {"app", "state", "phase"}, installProgress},
+      {"hold-placeholder", {"app"}, holdPlaceholder},
+      {"release-placeholder", {"app"}, releasePlaceholder},
+      {"host-offers", {"operation", "offered"}, hostOffers},
   };
   return table;
 }

@@ -193,6 +193,18 @@ void Runner::startBackground(const Step& step) {
     }
     background.done = true;
   });
+  letBackgroundGetGoing(background);
+}
+
+void Runner::letBackgroundGetGoing(const Background& background) {
+  // Real time again, only as a bound: the next step starts once this one has finished or may
+  // be waiting for something only the script moves, so that time moved by a later `advance`
+  // is time the step waits through, and what it did before its wait is done.
+  const auto giveUp = std::chrono::steady_clock::now() + patience_;
+  while (!background.done && std::chrono::steady_clock::now() < giveUp) {
+    if (session_.clock().waiterCount() > 0 || !session_.heldServices().empty()) return;
+    std::this_thread::sleep_for(std::chrono::milliseconds(1));
+  }
 }
 
 std::string Runner::collect(Background& background) {

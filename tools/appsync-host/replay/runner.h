@@ -37,7 +37,8 @@ class Runner {
   // session has settled (a test's own timer queue).
   void alsoSettle(std::function<void()> settle) { extraSettle_ = std::move(settle); }
   // How long an await lets a background step run before it looks for a held service or a wait
-  // on the clock that keeps the step from finishing (real time; 10 seconds by default).
+  // on the clock that keeps the step from finishing, and the most a background step is given to
+  // get going before the next step starts (real time; 10 seconds by default).
   void setPatience(std::chrono::milliseconds patience) { patience_ = patience; }
 
   // Runs every step; returns how many failed. An action's bad arguments stop the replay with
@@ -56,6 +57,9 @@ class Runner {
   void runStep(const Step& step);
   void runAwait(const Step& step, StepRecord& record);
   void startBackground(const Step& step);
+  // Returns once the step has finished, or some thread waits on the clock, or a service is held
+  // (or after the patience).
+  void letBackgroundGetGoing(const Background& background);
   // Joins a background step; rethrows its InputError, else gives its failure (empty: none).
   std::string collect(Background& background);
   // Waits for a background step to finish. When it is still running after a while and can only
