@@ -35,7 +35,8 @@ void AppsClient::assetTransfer(const std::shared_ptr<TRAsset>& asset, double upd
     _accessQueue->sync([&] { existingApp = _updatingApps.count(identifier) > 0; });
     updateTransferProgressForApp(asset, existingApp);
   } else if (auto progress = _progressForAssetIdentifier(identifier)) {
-    const auto units = static_cast<std::int64_t>(updatedProgress * 1000.0);
+    const auto units =
+        static_cast<std::int64_t>(updatedProgress * static_cast<double>(kTransferProgressUnits));
     progress->setInstallState(ARInstallStateActive);
     if (progress->totalUnitCount() != kTransferProgressUnits) {
       progress->setTotalUnitCount(kTransferProgressUnits);
