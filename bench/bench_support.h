@@ -1,9 +1,15 @@
 // What the benchmarks share.
 #pragma once
 
+#include <stdlib.h>
+
 #include <atomic>
 #include <cstdint>
+#include <cstdlib>
+#include <filesystem>
+#include <string>
 #include <string_view>
+#include <system_error>
 
 #include "runtime/log/log.h"
 
@@ -20,6 +26,29 @@ class CountingLogSink final : public LogSink {
 
  private:
   std::atomic<std::uint64_t> count_{0};
+};
+
+// A fresh directory TMPDIR/NAME.XXXXXX (TMPDIR defaults to /tmp), removed with everything in it.
+// Its path is empty when it could not be made.
+class TempDir {
+ public:
+  explicit TempDir(std::string_view name) {
+    const char* tmp = std::getenv("TMPDIR");
+    std::string pattern = std::string(tmp && *tmp ? tmp : "/tmp") + "/";
+    pattern.append(name).append(".XXXXXX");
+    if (::mkdtemp(pattern.data())) path_ = pattern;
+  }
+  ~TempDir() {
+    std::error_code ec;
+    if (!path_.empty()) std::filesystem::remove_all(path_, ec);
+  }
+  TempDir(const TempDir&) = delete;
+  TempDir& operator=(const TempDir&) = delete;
+
+  const std::filesystem::path& path() const { return path_; }
+
+ private:
+  std::filesystem::path path_;
 };
 
 }  // namespace appsync::bench

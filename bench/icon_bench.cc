@@ -2,11 +2,12 @@
 // the corner mask and PNG encoding, from a large (1024 px) and a small (180 px) source icon.
 #include <benchmark/benchmark.h>
 
-#include <cstdlib>
+#include <cstdint>
 #include <filesystem>
 #include <fstream>
 #include <string>
 
+#include "bench_support.h"
 #include "platform/icon/home_screen_icon_service.h"
 #include "platform/icon/png_codec.h"
 
@@ -18,21 +19,10 @@ namespace fs = std::filesystem;
 // A scratch directory holding one bundle per source size, removed at exit.
 class BenchBundles {
  public:
-  BenchBundles() {
-    std::string pattern = (fs::temp_directory_path() / "appsync-icon-bench-XXXXXX").string();
-    if (::mkdtemp(pattern.data())) root_ = pattern;
-  }
-  ~BenchBundles() {
-    std::error_code ec;
-    fs::remove_all(root_, ec);
-  }
-  BenchBundles(const BenchBundles&) = delete;
-  BenchBundles& operator=(const BenchBundles&) = delete;
-
   // The bundle whose icon is a side x side picture with detail (gradients and a pattern), so
   // that decoding and averaging do real work.
   std::string bundle(int side) {
-    const fs::path dir = root_ / ("App" + std::to_string(side) + ".app");
+    const fs::path dir = root_.path() / ("App" + std::to_string(side) + ".app");
     if (fs::exists(dir)) return dir.string();
     fs::create_directories(dir);
     icon::Image image(side, side);
@@ -57,7 +47,7 @@ class BenchBundles {
   }
 
  private:
-  fs::path root_;
+  bench::TempDir root_{"icon_bench"};
 };
 
 BenchBundles& bundles() {

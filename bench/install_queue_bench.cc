@@ -7,24 +7,18 @@
 
 #include <chrono>
 #include <cstdio>
-#include <cstdlib>
-#include <filesystem>
 #include <memory>
 #include <string>
 #include <thread>
 #include <vector>
 
-#include "bench_support.h"
-#include "client/apps_client.h"
+#include "bench_device.h"
 #include "platform/ar_wrapper.h"
-#include "platform/fake/fake_platform.h"
 #include "runtime/fs/files.h"
 #include "state/todo_list.h"
 
 namespace appsync {
 namespace {
-
-namespace fs = std::filesystem;
 
 constexpr int kInstalls = 100;
 constexpr std::chrono::milliseconds kInstallTime{50};
@@ -51,43 +45,29 @@ class SlowRegistry final : public ARApplicationWorkspaceWrapper {
 class InstallQueueDevice {
  public:
   InstallQueueDevice() {
-    const char* tmp = std::getenv("TMPDIR");
-    std::string pattern = std::string(tmp && *tmp ? tmp : "/tmp") + "/install_queue_bench.XXXXXX";
-    if (!::mkdtemp(pattern.data())) return;
-    root_ = pattern;
-    device_ = std::make_unique<FakePlatform>(fs::path(root_));
-    device_->tr().logger().setSink(sink_);
+    if (!device_.made()) return;
+    FakePlatform& device = device_.device();
     plist::Array todoList;
     for (int i = 0; i < kInstalls; ++i) {
       todoList.emplace_back(plist::Dict{{std::string(kTodoIdentifierKey), appIdentifier(i)},
                                         {std::string(kTodoOperationKey), "install"}});
     }
-    if (!createDirectories(device_->paths().syncFolder()) ||
-        !writePlistAtomically(device_->paths().todoList(), todoList, plist::Format::Binary)) {
+    if (!createDirectories(device.paths().syncFolder()) ||
+        !writePlistAtomically(device.paths().todoList(), todoList, plist::Format::Binary)) {
       return;
     }
-    registry_ = std::make_unique<SlowRegistry>(device_->ar());
-    client_ = std::make_unique<AppsClient>(device_->platform().with(*registry_));
+    device_.openClient(std::make_unique<SlowRegistry>(device.ar()));
   }
-  ~InstallQueueDevice() {
-    client_.reset();
-    registry_.reset();
-    device_.reset();
-    std::error_code ec;
-    if (!root_.empty()) fs::remove_all(root_, ec);
-  }
-  InstallQueueDevice(const InstallQueueDevice&) = delete;
-  InstallQueueDevice& operator=(const InstallQueueDevice&) = delete;
 
-  bool ok() const { return client_ != nullptr; }
-  AppsClient& client() { return *client_; }
+  bool ok() const { return device_.ok(); }
+  AppsClient& client() { return device_.client(); }
 
   // A delivered bundle folder and its asset for every app (each install removes its package).
   bool stagePackages() {
     assets_.clear();
     for (int i = 0; i < kInstalls; ++i) {
       const std::string id = appIdentifier(i);
-      const std::string bundle = root_ + "/staging/" + id + ".app";
+      const std::string bundle = (device_.root() / "staging" / (id + ".app")).string();
       if (!createDirectories(bundle) ||
           !writePlistAtomically(bundle + "/Info.plist", plist::Dict{{"BNBundleIdentifier", id}},
                                 plist::Format::Binary)) {
@@ -100,16 +80,12 @@ class InstallQueueDevice {
     return true;
   }
   void installAll() {
-    for (const auto& asset : assets_) client_->_enqueueAssetInstall(asset);
-    client_->waitForInstalls();
+    for (const auto& asset : assets_) client()._enqueueAssetInstall(asset);
+    client().waitForInstalls();
   }
 
  private:
-  std::string root_;
-  std::shared_ptr<bench::CountingLogSink> sink_ = std::make_shared<bench::CountingLogSink>();
-  std::unique_ptr<FakePlatform> device_;
-  std::unique_ptr<SlowRegistry> registry_;
-  std::unique_ptr<AppsClient> client_;
+  bench::TempDevice device_{"install_queue_bench"};
   std::vector<std::shared_ptr<TRAsset>> assets_;
 };
 

@@ -5,15 +5,11 @@
 // lists.
 #include <benchmark/benchmark.h>
 
+#include <cstdint>
 #include <cstdio>
-#include <cstdlib>
-#include <filesystem>
-#include <memory>
 #include <string>
 
-#include "bench_support.h"
-#include "client/apps_client.h"
-#include "platform/fake/fake_platform.h"
+#include "bench_device.h"
 #include "runtime/fs/files.h"
 
 namespace appsync {
@@ -33,18 +29,14 @@ std::string app(const char* group, int i) {
 class InventoryDevice {
  public:
   InventoryDevice() {
-    std::string pattern =
-        (std::filesystem::temp_directory_path() / "appsync-bench-XXXXXX").string();
-    if (!::mkdtemp(pattern.data())) return;
-    root_ = pattern;
-    device_ = std::make_unique<FakePlatform>(root_);
-    device_->tr().logger().setSink(sink_);
+    if (!device_.made()) return;
+    FakePlatform& device = device_.device();
 
     plist::Array lastSync;
-    for (int i = 0; i < kFromInstaller; ++i) device_->em().addUninstalled(app("removed", i));
+    for (int i = 0; i < kFromInstaller; ++i) device.em().addUninstalled(app("removed", i));
     for (int i = 0; i < kGoneSinceLastSync; ++i) lastSync.emplace_back(app("gone", i));
     for (int i = 0; i < kStillInstalled; ++i) {
-      device_->ar().putApplication({.identifier = app("kept", i)});
+      device.ar().putApplication({.identifier = app("kept", i)});
       lastSync.emplace_back(app("kept", i));
     }
     // Every other candidate has a record: a third of those still being worked on, the rest
@@ -56,30 +48,21 @@ class InventoryDevice {
           i % 2 ? app(i % 4 == 1 ? "removed" : "gone", i / 2 % 5000) : app("other", i);
       todo.emplace_back(plist::Dict{{"identifier", id}, {"operation", states[i % 3]}});
     }
-    const Paths& paths = device_->paths();
+    const Paths& paths = device.paths();
     createDirectories(paths.syncFolder());
     ok_ = writePlistAtomically(paths.todoList(), plist::Value(std::move(todo)),
                                plist::Format::Binary) &&
           writePlistAtomically(paths.lastSyncAppState(), plist::Value(std::move(lastSync)),
                                plist::Format::Binary);
-    client_ = std::make_unique<AppsClient>(device_->platform());
-  }
-  ~InventoryDevice() {
-    client_.reset();
-    device_.reset();
-    std::error_code ec;
-    if (!root_.empty()) std::filesystem::remove_all(root_, ec);
+    device_.openClient();
   }
 
   bool ok() const { return ok_; }
-  AppsClient& client() { return *client_; }
-  std::uint64_t logLines() const { return sink_->count(); }
+  AppsClient& client() { return device_.client(); }
+  std::uint64_t logLines() const { return device_.logLines(); }
 
  private:
-  std::filesystem::path root_;
-  std::shared_ptr<bench::CountingLogSink> sink_ = std::make_shared<bench::CountingLogSink>();
-  std::unique_ptr<FakePlatform> device_;
-  std::unique_ptr<AppsClient> client_;
+  bench::TempDevice device_{"installed_assets_bench"};
   bool ok_ = false;
 };
 

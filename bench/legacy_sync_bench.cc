@@ -9,13 +9,13 @@
 #include <benchmark/benchmark.h>
 
 #include <cstdio>
-#include <cstdlib>
 #include <filesystem>
 #include <fstream>
 #include <memory>
 #include <sstream>
 #include <string>
 
+#include "bench_support.h"
 #include "replay/runner.h"
 #include "runtime/fs/files.h"
 #include "runtime/plist/codec.h"
@@ -88,27 +88,6 @@ std::string notInstalled(const DeviceSession& session, int apps) {
   return "";
 }
 
-// A temporary directory holding the script and the device; removed with everything in it.
-class Workspace {
- public:
-  Workspace() {
-    const char* tmp = std::getenv("TMPDIR");
-    std::string pattern = std::string(tmp && *tmp ? tmp : "/tmp") + "/legacy_sync_bench.XXXXXX";
-    if (::mkdtemp(pattern.data())) path_ = pattern;
-  }
-  ~Workspace() {
-    std::error_code ec;
-    if (!path_.empty()) fs::remove_all(path_, ec);
-  }
-  Workspace(const Workspace&) = delete;
-  Workspace& operator=(const Workspace&) = delete;
-
-  const fs::path& path() const { return path_; }
-
- private:
-  fs::path path_;
-};
-
 // One sync on a fresh device at `root`. Empty when every step passed and every app ended
 // installed; else what went wrong. Only running the steps is timed.
 std::string timedSync(benchmark::State& state, const Script& script, const fs::path& root,
@@ -132,7 +111,7 @@ std::string timedSync(benchmark::State& state, const Script& script, const fs::p
 
 void BM_LegacySync(benchmark::State& state) {
   const int apps = static_cast<int>(state.range(0));
-  Workspace workspace;
+  const bench::TempDir workspace("legacy_sync_bench");
   if (workspace.path().empty()) {
     state.SkipWithError("could not make the temporary directory");
     return;

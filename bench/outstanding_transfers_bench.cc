@@ -6,23 +6,18 @@
 // lies in TMPDIR (default /tmp).
 #include <benchmark/benchmark.h>
 
+#include <cstdint>
 #include <cstdio>
-#include <cstdlib>
-#include <filesystem>
-#include <memory>
+#include <optional>
 #include <string>
 #include <vector>
 
-#include "bench_support.h"
-#include "client/apps_client.h"
-#include "platform/fake/fake_platform.h"
+#include "bench_device.h"
 #include "platform/icon/png_codec.h"
 #include "runtime/fs/files.h"
 
 namespace appsync {
 namespace {
-
-namespace fs = std::filesystem;
 
 constexpr int kInstalls = 1000;
 constexpr int kIconSide = 180;
@@ -51,17 +46,13 @@ std::optional<std::vector<std::uint8_t>> iconPng(int i) {
 class SyncFolderDevice {
  public:
   SyncFolderDevice() {
-    const char* tmp = std::getenv("TMPDIR");
-    std::string pattern = std::string(tmp && *tmp ? tmp : "/tmp") + "/transfers_bench.XXXXXX";
-    if (!::mkdtemp(pattern.data())) return;
-    root_ = pattern;
-    device_ = std::make_unique<FakePlatform>(fs::path(root_));
-    device_->tr().logger().setSink(sink_);
+    if (!device_.made()) return;
+    FakePlatform& device = device_.device();
     plist::Array todoList;
     std::vector<std::string> iconOrder;
     for (int i = 0; i < kInstalls; ++i) {
       const std::string id = appIdentifier(i);
-      const std::string folder = *device_->paths().packageDirectory(id);
+      const std::string folder = *device.paths().packageDirectory(id);
       std::optional<std::vector<std::uint8_t>> png = iconPng(i);
       const plist::Dict info{{"BNBundleIdentifier", id},
                              {"BNBundleVersion", "1.0"},
@@ -78,36 +69,21 @@ class SyncFolderDevice {
                                         {"name", "Voyage " + std::to_string(i)}});
       if (i % 2 == 0) iconOrder.push_back(id);
     }
-    if (!writePlistAtomically(device_->paths().todoList(), todoList, plist::Format::Binary)) {
+    if (!writePlistAtomically(device.paths().todoList(), todoList, plist::Format::Binary)) {
       return;
     }
-    device_->pv().setIconOrder(iconOrder);
-    client_ = std::make_unique<AppsClient>(device_->platform());
+    device.pv().setIconOrder(iconOrder);
+    device_.openClient();
   }
-  ~SyncFolderDevice() {
-    client_.reset();
-    device_.reset();
-    std::error_code ec;
-    if (!root_.empty()) fs::remove_all(root_, ec);
-  }
-  SyncFolderDevice(const SyncFolderDevice&) = delete;
-  SyncFolderDevice& operator=(const SyncFolderDevice&) = delete;
 
-  bool ok() const { return client_ != nullptr; }
-  AppsClient& client() { return *client_; }
+  bool ok() const { return device_.ok(); }
+  AppsClient& client() { return device_.client(); }
 
   // Takes away the placeholders a call made, so that the next call makes them again.
-  void removePlaceholders() {
-    device_->ar().drain();
-    for (int i = 0; i < kInstalls; ++i) device_->ar().removeApplication(appIdentifier(i));
-    removeAll((fs::path(root_) / "tmp/com.vantor.trc.Apps").string());
-  }
+  void removePlaceholders() { device_.removePlaceholders(kInstalls, appIdentifier); }
 
  private:
-  std::string root_;
-  std::shared_ptr<bench::CountingLogSink> sink_ = std::make_shared<bench::CountingLogSink>();
-  std::unique_ptr<FakePlatform> device_;
-  std::unique_ptr<AppsClient> client_;
+  bench::TempDevice device_{"transfers_bench"};
 };
 
 void BM_OutstandingTransfersLegacy(benchmark::State& state) {

@@ -10,7 +10,6 @@
 #include <malloc.h>
 
 #include <algorithm>
-#include <atomic>
 #include <chrono>
 #include <cstdint>
 #include <cstdio>
@@ -23,9 +22,7 @@
 #include <string>
 #include <vector>
 
-#include "bench_support.h"
-#include "client/apps_client.h"
-#include "platform/fake/fake_platform.h"
+#include "bench_device.h"
 #include "runtime/fs/files.h"
 #include "runtime/plist/codec.h"
 
@@ -38,8 +35,6 @@ constexpr int kApps = 10000;
 constexpr int kAccounts = 4;
 constexpr const char* kMetadataName = "CaravelMetadata.plist";
 constexpr const char* kDownloadInfoKey = "com.vantor.CaravelStore.downloadInfo";
-
-using bench::CountingLogSink;
 
 std::string format(const char* pattern, int value) {
   char text[160];
@@ -160,17 +155,13 @@ bool writeNewFile(const std::string& path, const plist::Bytes& bytes) {
 class ReportingDevice {
  public:
   ReportingDevice() {
-    const char* tmp = std::getenv("TMPDIR");
-    std::string pattern = std::string(tmp && *tmp ? tmp : "/tmp") + "/reporting_bench.XXXXXX";
-    if (!::mkdtemp(pattern.data())) return;
-    root_ = pattern;
-    pristine_ = root_ / "pristine";
-    device_ = std::make_unique<FakePlatform>(root_);
-    device_->tr().logger().setSink(sink_);
+    if (!device_.made()) return;
+    pristine_ = device_.root() / "pristine";
     fs::create_directories(pristine_);
+    FakeARWorkspace& registry = device_.device().ar();
     for (int i = 0; i < kApps; ++i) {
       const std::string id = format("com.example.harbour%05d", i);
-      std::optional<std::string> container = device_->ar().containerDirectoryFor(id);
+      std::optional<std::string> container = registry.containerDirectoryFor(id);
       if (!container || !createDirectories(*container)) return;
       const std::string file = *container + "/" + kMetadataName;
       std::optional<plist::Bytes> bytes = plist::writeBinary(storeMetadata(i));
@@ -179,30 +170,22 @@ class ReportingDevice {
       }
       metadataBytes_ += bytes->size();
       files_.push_back(file);
-      device_->ar().putApplication({.identifier = id,
-                                    .version = format("4.12.%d", i % 40),
-                                    .name = format("Harbour Tales %05d", i),
-                                    .containerDirectory = container,
-                                    .staticDiskUsage = 48u * 1024 * 1024,
-                                    .hasMIDBasedSINF = deviceBased(i)});
+      registry.putApplication({.identifier = id,
+                               .version = format("4.12.%d", i % 40),
+                               .name = format("Harbour Tales %05d", i),
+                               .containerDirectory = container,
+                               .staticDiskUsage = 48u * 1024 * 1024,
+                               .hasMIDBasedSINF = deviceBased(i)});
     }
-    client_ = std::make_unique<AppsClient>(device_->platform());
+    device_.openClient();
   }
-  ~ReportingDevice() {
-    client_.reset();
-    device_.reset();
-    std::error_code ec;
-    if (!root_.empty()) fs::remove_all(root_, ec);
-  }
-  ReportingDevice(const ReportingDevice&) = delete;
-  ReportingDevice& operator=(const ReportingDevice&) = delete;
 
-  bool ok() const { return client_ != nullptr; }
-  AppsClient& client() { return *client_; }
-  FakePlatform& device() { return *device_; }
+  bool ok() const { return device_.ok(); }
+  AppsClient& client() { return device_.client(); }
+  FakePlatform& device() { return device_.device(); }
   const std::string& metadataFile(int i) const { return files_[i]; }
   double averageFileBytes() const { return static_cast<double>(metadataBytes_) / kApps; }
-  std::uint64_t logLines() const { return sink_->count(); }
+  std::uint64_t logLines() const { return device_.logLines(); }
 
   // Puts every metadata file back as it was built.
   bool restore() {
@@ -217,11 +200,8 @@ class ReportingDevice {
  private:
   fs::path pristineCopy(int i) const { return pristine_ / format("%05d.plist", i); }
 
-  fs::path root_;
+  bench::TempDevice device_{"reporting_bench"};
   fs::path pristine_;
-  std::shared_ptr<CountingLogSink> sink_ = std::make_shared<CountingLogSink>();
-  std::unique_ptr<FakePlatform> device_;
-  std::unique_ptr<AppsClient> client_;
   std::vector<std::string> files_;
   std::size_t metadataBytes_ = 0;
 };

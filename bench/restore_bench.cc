@@ -7,14 +7,11 @@
 #include <benchmark/benchmark.h>
 
 #include <cstdio>
-#include <cstdlib>
 #include <filesystem>
-#include <memory>
+#include <optional>
 #include <string>
 
-#include "bench_support.h"
-#include "client/apps_client.h"
-#include "platform/fake/fake_platform.h"
+#include "bench_device.h"
 #include "platform/icon/png_codec.h"
 #include "runtime/fs/files.h"
 #include "runtime/plist/codec.h"
@@ -69,47 +66,33 @@ std::optional<plist::Dict> restoreList(int apps) {
 class RestoredDevice {
  public:
   explicit RestoredDevice(int apps) : apps_(apps) {
-    const char* tmp = std::getenv("TMPDIR");
-    std::string pattern = std::string(tmp && *tmp ? tmp : "/tmp") + "/restore_bench.XXXXXX";
-    if (!::mkdtemp(pattern.data())) return;
-    root_ = pattern;
+    if (!device_.made()) return;
     std::optional<plist::Dict> list = restoreList(apps);
     if (!list) return;
     std::optional<plist::Bytes> bytes = plist::writeBinary(plist::Value(std::move(*list)));
     if (!bytes) return;
     listBytes_ = std::move(*bytes);
-    device_ = std::make_unique<FakePlatform>(fs::path(root_));
-    device_->tr().logger().setSink(sink_);
-    client_ = std::make_unique<AppsClient>(device_->platform());
+    device_.openClient();
   }
-  ~RestoredDevice() {
-    client_.reset();
-    device_.reset();
-    std::error_code ec;
-    if (!root_.empty()) fs::remove_all(root_, ec);
-  }
-  RestoredDevice(const RestoredDevice&) = delete;
-  RestoredDevice& operator=(const RestoredDevice&) = delete;
 
-  bool ok() const { return client_ != nullptr; }
-  AppsClient& client() { return *client_; }
+  bool ok() const { return device_.ok(); }
+  AppsClient& client() { return device_.client(); }
 
   // The host's restore list in place, and no placeholder of an earlier call left.
   bool stage() {
-    device_->ar().drain();
-    for (int i = 0; i < apps_; ++i) device_->ar().removeApplication(appIdentifier(i));
-    removeAll((fs::path(root_) / "tmp/com.vantor.trc.Apps").string());
-    const std::string path = device_->paths().restoreList();
+    device_.removePlaceholders(apps_, appIdentifier);
+    const std::string path = device_.device().paths().restoreList();
     return createDirectories(fs::path(path).parent_path().string()) &&
            writeFileAtomically(path, listBytes_);
   }
 
   // The registry's restore placeholders of the listed apps.
   int restorePlaceholders() {
-    device_->ar().drain();
+    FakeARWorkspace& registry = device_.device().ar();
+    registry.drain();
     int count = 0;
     for (int i = 0; i < apps_; ++i) {
-      const auto record = device_->ar().application(appIdentifier(i));
+      const auto record = registry.application(appIdentifier(i));
       if (record && record->isPlaceholder && record->installType == ARInstallTypeRestore) ++count;
     }
     return count;
@@ -117,11 +100,8 @@ class RestoredDevice {
 
  private:
   int apps_;
-  std::string root_;
   plist::Bytes listBytes_;
-  std::shared_ptr<bench::CountingLogSink> sink_ = std::make_shared<bench::CountingLogSink>();
-  std::unique_ptr<FakePlatform> device_;
-  std::unique_ptr<AppsClient> client_;
+  bench::TempDevice device_{"restore_bench"};
 };
 
 void BM_RestoreLegacy(benchmark::State& state) {

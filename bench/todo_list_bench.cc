@@ -1,7 +1,6 @@
 // Cost of one todo-list change: warm (the writer reuses the list it wrote last), cold (another
 // writer replaced the file before each change), and ten threads sharing one writer.
 #include <benchmark/benchmark.h>
-#include <stdlib.h>
 
 #include <algorithm>
 #include <atomic>
@@ -36,11 +35,8 @@ std::string numbered(const char* prefix, int i) {
 class TodoFixture {
  public:
   explicit TodoFixture(int records) : expected_(records, std::string(kTodoInstall)) {
-    const char* tmp = std::getenv("TMPDIR");
-    std::string pattern = std::string(tmp && *tmp ? tmp : "/tmp") + "/todo_list_bench.XXXXXX";
-    if (!::mkdtemp(pattern.data())) return;
-    dir_ = pattern;
-    path_ = dir_ + "/ApplicationsSync.plist";
+    if (dir_.path().empty()) return;
+    path_ = (dir_.path() / "ApplicationsSync.plist").string();
     plist::Array list;
     list.reserve(records);
     for (int i = 0; i < records; ++i) {
@@ -54,10 +50,6 @@ class TodoFixture {
     tr_.logger().setSink(sink_);
     todo_ = std::make_unique<TodoList>(path_, tr_);
   }
-  ~TodoFixture() {
-    if (!dir_.empty()) removeAll(dir_);
-  }
-
   bool ok() const { return todo_ != nullptr; }
   int size() const { return static_cast<int>(expected_.size()); }
   TodoList& todo() { return *todo_; }
@@ -75,7 +67,7 @@ class TodoFixture {
   // Replaces the file with a copy of itself, as the host rewriting the list would: the writer
   // must notice and read it again.
   bool replaceFile() {
-    const std::string copy = dir_ + "/.replacement";
+    const std::string copy = (dir_.path() / ".replacement").string();
     removeFile(copy);
     return copyFile(path_, copy) && moveItem(copy, path_);
   }
@@ -109,7 +101,7 @@ class TodoFixture {
   }
 
  private:
-  std::string dir_;
+  bench::TempDir dir_{"todo_list_bench"};
   std::string path_;
   std::vector<std::string> ids_;
   std::vector<std::string> expected_;
