@@ -1,17 +1,21 @@
 // The serial queue: exclusive, in-order execution of work on the caller's thread.
 #include "runtime/dispatch/serial_queue.h"
 
-#include <algorithm>
 #include <cstdio>
 #include <cstdlib>
-#include <vector>
 
 namespace appsync {
 
 namespace {
 
-// The queues whose items the current thread is running, innermost last.
-thread_local std::vector<const SerialQueue*> tCurrentQueues;
+// The queues whose items the current thread is running: a chain of frames on the stacks of the
+// sync() calls, innermost first. A plain pointer has nothing to destroy, so the chain stays
+// usable on a thread that is ending and during static destruction (a client destroyed then).
+struct Frame {
+  const SerialQueue* queue;
+  const Frame* outer;
+};
+thread_local const Frame* tInnermost = nullptr;
 
 }  // namespace
 
@@ -25,15 +29,20 @@ void SerialQueue::sync(const std::function<void()>& work) {
     std::abort();
   }
   std::lock_guard<std::mutex> guard(mutex_);
-  tCurrentQueues.push_back(this);
+  const Frame frame{this, tInnermost};
+  tInnermost = &frame;
   struct Pop {
-    ~Pop() { tCurrentQueues.pop_back(); }
-  } pop;
+    const Frame& frame;
+    ~Pop() { tInnermost = frame.outer; }
+  } pop{frame};
   work();
 }
 
 bool SerialQueue::isCurrent() const {
-  return std::find(tCurrentQueues.begin(), tCurrentQueues.end(), this) != tCurrentQueues.end();
+  for (const Frame* frame = tInnermost; frame; frame = frame->outer) {
+    if (frame->queue == this) return true;
+  }
+  return false;
 }
 
 }  // namespace appsync
