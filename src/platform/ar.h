@@ -24,6 +24,8 @@ inline constexpr std::string_view ARPackageTypeKey = "PackageType";
 inline constexpr std::string_view ARPackageTypeCustomer = "Customer";
 inline constexpr std::string_view ARPackageTypePlaceholder = "Placeholder";
 inline constexpr std::string_view ARInstallTypeKey = "ARInstallType";
+// Uninstall option: remove the application only if it is a placeholder.
+inline constexpr std::string_view ARUninstallPlaceholdersOnlyKey = "UninstallPlaceholdersOnly";
 
 // Install types.
 inline constexpr std::uint64_t ARInstallTypeNone = 0;
@@ -112,7 +114,7 @@ class ARBundleProxy {
 class ARApplicationProxy : public ARBundleProxy {
  public:
   std::string applicationIdentifier;
-  std::string applicationType;  // "User", "System"
+  std::string applicationType;                    // "User", "System"
   std::optional<std::string> bundleContainerURL;  // directory holding the bundle and metadata
   std::optional<std::string> bundleURL;           // the bundle directory
   std::optional<std::string> bundleVersion;

@@ -2,8 +2,6 @@
 // placeholder, through the coordination service or the registry, so the home screen shows it at
 // once. On the coordinated road the client then waits a bounded time for the service to install
 // the placeholders. The list is moved to its log copy afterwards, so it is processed once.
-#include <sys/stat.h>
-
 #include <algorithm>
 #include <chrono>
 #include <filesystem>
@@ -46,18 +44,13 @@ std::optional<plist::Bytes> bytesAt(const plist::Dict& record, std::string_view 
   return *bytes;
 }
 
-bool isLink(const std::string& path) {
-  struct stat status {};
-  return ::lstat(path.c_str(), &status) == 0 && S_ISLNK(status.st_mode);
-}
-
 }  // namespace
 
 void AppsClient::_processCaravelRestoreInfo() {
   const Paths& paths = platform_.paths;
   const std::string restoreList = paths.restoreList();
   // A list that is a link is the host's way out of the root: it is not ours to read or move.
-  if (!fileExists(restoreList) || isLink(restoreList)) {
+  if (!fileExists(restoreList) || isSymbolicLink(restoreList)) {
     logDefault("%s|no caravel restore plist found - skipping processing of caravel restored apps");
     return;
   }

@@ -16,13 +16,6 @@ namespace {
 
 constexpr const char* kCaravelSyncScenario = "Caravel Sync";
 
-// True when `path` is a symbolic link. The staging area and what it holds come from another
-// computer: a link there may point anywhere, so none is followed or moved.
-bool isLink(const std::string& path) {
-  struct stat status {};
-  return ::lstat(path.c_str(), &status) == 0 && S_ISLNK(status.st_mode);
-}
-
 }  // namespace
 
 bool AppsClient::reconcileSync(std::uint32_t /*syncType*/, const std::string& newAnchor,
@@ -34,7 +27,9 @@ bool AppsClient::reconcileSync(std::uint32_t /*syncType*/, const std::string& ne
   if (tookOver && !nothingStaged) {
     const bool removalAllowed = _appRemovalAllowed();
     std::optional<plist::Array> toDoList;
-    if (isLink(paths.todoList())) {
+    // The sync folder's files come from another computer: a link there may point anywhere, so
+    // none is followed.
+    if (isSymbolicLink(paths.todoList())) {
       setError(error, makePOSIXError(ELOOP, paths.todoList()));
     } else {
       toDoList = _loadPlist(platform_.tr, paths.todoList(), error);
@@ -48,7 +43,7 @@ bool AppsClient::reconcileSync(std::uint32_t /*syncType*/, const std::string& ne
     }
 
     _notifyPavilion(platform_, true);
-    if (!isLink(paths.iconLayout())) _sendIconLayoutToPavilion(platform_);
+    if (!isSymbolicLink(paths.iconLayout())) _sendIconLayoutToPavilion(platform_);
     if (toDoList) {
       writePlistAtomically(paths.todoListDebugCopy(), plist::Value(std::move(*toDoList)),
                            plist::Format::Binary);

@@ -263,7 +263,7 @@ std::vector<std::shared_ptr<TRAsset>> AppsClient::outstandingAssetTransfers() {
     // 12. A package an earlier transfer left on the device.
     bool recoveredPackageExists = false;
     const std::optional<plist::Value> recorded =
-        _restoreStatePropertyForKey("path", *identifier, version);
+        _restoreStatePropertyForKey(std::string(kRestoreStatePathKey), *identifier, version);
     if (const std::string* recoveredPath = recorded ? recorded->string() : nullptr) {
       recoveredPackageExists = fileExists(*recoveredPath);
       if (recoveredPackageExists) {

@@ -14,8 +14,6 @@ namespace appsync {
 
 namespace {
 
-constexpr std::string_view kRestorePathKey = "path";
-constexpr std::string_view kUninstallPlaceholdersOnlyKey = "UninstallPlaceholdersOnly";
 // The host's progress reports become this many units of the registry's install progress.
 constexpr std::int64_t kTransferProgressUnits = 1000;
 
@@ -86,7 +84,7 @@ void AppsClient::_transferSucceeded(const std::shared_ptr<TRAsset>& asset,
   } else {
     if (!path) {
       const std::optional<plist::Value> recorded =
-          _restoreStatePropertyForKey(std::string(kRestorePathKey), identifier, version);
+          _restoreStatePropertyForKey(std::string(kRestoreStatePathKey), identifier, version);
       if (const std::string* text = recorded ? recorded->string() : nullptr) path = *text;
       asset->setPath(path);
     }
@@ -140,7 +138,7 @@ void AppsClient::_transferSucceeded(const std::shared_ptr<TRAsset>& asset,
   // The install waits for the data part, which comes as a restore transfer of its own.
   logDefault("%s|Restore data exists for %{public}@", identifier);
   if (progress) progress->setInstallPhase(ARInstallPhaseRestoringData);
-  _setRestoreStatePropertyValue(plist::Value(*path), std::string(kRestorePathKey), identifier,
+  _setRestoreStatePropertyValue(plist::Value(*path), std::string(kRestoreStatePathKey), identifier,
                                 version);
 }
 
@@ -162,7 +160,7 @@ void AppsClient::_transferFailed(const std::shared_ptr<TRAsset>& asset, const Er
   if (progress && progress->installState() < ARInstallStateCanceled) progress->cancel();
   logDefault("%s|Uninstalling placeholder %{public}@", identifier);
   if (!_useInstallCoordinator) {
-    const plist::Dict options{{std::string(kUninstallPlaceholdersOnlyKey), true}};
+    const plist::Dict options{{std::string(ARUninstallPlaceholdersOnlyKey), true}};
     const bool removed = platform_.ar.uninstallApplication(identifier, options);
     logDefault("%s|Uninstalling app using AR %{public}@ %s", identifier,
                removed ? "secceeded" : "failed");

@@ -92,9 +92,6 @@ class FakeARWorkspace final : public ARApplicationWorkspace, public FakeService 
     bool operator==(const UninstallCall&) const = default;
   };
 
-  // Option of uninstallApplication: remove the application only if it is a placeholder.
-  static constexpr std::string_view kUninstallPlaceholdersOnlyKey = "UninstallPlaceholdersOnly";
-
   // `root`: the device root under which packages get their containers.
   explicit FakeARWorkspace(std::filesystem::path root);
 

@@ -36,7 +36,7 @@ bool FakeARWorkspace::uninstallApplication(const std::string& identifier,
   const bool failed = beginCall(kUninstall) != nullptr;
   bool placeholdersOnly = false;
   if (options) {
-    if (const plist::Value* v = options->find(kUninstallPlaceholdersOnlyKey)) {
+    if (const plist::Value* v = options->find(ARUninstallPlaceholdersOnlyKey)) {
       placeholdersOnly = v->truthValue().value_or(false);
     }
   }

@@ -76,6 +76,8 @@ std::optional<plist::Dict> readPlistDictionary(const std::string& path);
 
 bool fileExists(const std::string& path);
 bool directoryExists(const std::string& path);
+// True when `path` itself is a symbolic link (not followed).
+bool isSymbolicLink(const std::string& path);
 
 // The length of the longest prefix of `path` that ends at a component boundary and names an
 // existing directory: path.size() when the whole path is one, 0 when no prefix is. Found from
